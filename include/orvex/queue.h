@@ -1,0 +1,10 @@
+// Event queue and operation tree: queue lines parsed into events, folded into
+// pending operations per path, handed out in arrival order.
+#ifndef ORVEX_QUEUE_H_
+#define ORVEX_QUEUE_H_
+
+#include "orvex/queue/event.h"
+#include "orvex/queue/op.h"
+#include "orvex/queue/op_tree.h"
+
+#endif  // ORVEX_QUEUE_H_

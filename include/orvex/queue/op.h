@@ -1,0 +1,97 @@
+// OP and OPNode: the pending operations of a share and the part of its
+// directory hierarchy they live in. A node is one path component; an op hangs
+// on the node of its path and is also listed, in arrival order, in its
+// OPTree. Both are owned through std::shared_ptr. One thread at a time.
+#ifndef ORVEX_QUEUE_OP_H_
+#define ORVEX_QUEUE_OP_H_
+
+#include <json/json.h>
+
+#include <functional>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "orvex/export.h"
+
+namespace orvex {
+namespace fileindex {
+
+// What the consumer must do for an op; stored and printed as an int.
+enum FileIndexOP : int {
+  OP_NONE = 0,           // cancelled; never handed to the consumer
+  OP_DELETE = 1,         // remove the document of the node's path
+  OP_UPSERT = 2,         // (re)index the file at the node's path
+  OP_ATTR = 3,           // refresh the attributes of the node's path
+  OP_UPDATE_CFG = 4,     // the folder configuration at the path changed; data holds it
+  OP_RENAME = 5,         // renamed from the op's path to the node's path
+  OP_REINDEX = 6,        // reindex the node's path and everything below it
+  OP_QUEUE_CRASHED = 7,  // the queue is incomplete: reindex the whole share
+};
+
+class OPNode;
+
+struct ORVEX_EXPORT OP {
+  OP(std::shared_ptr<OPNode> node, FileIndexOP kind, const std::string& path,
+     const Json::Value& data);
+
+  // Merges another configuration change of the same folder into data: each
+  // of "document", "audio", "video", "photo" ends true when either side has
+  // it true (a missing or non-bool member counts as false). Other keys stay.
+  void MergeData(const Json::Value& other);
+
+  std::shared_ptr<OPNode> node;  // the node whose path the op concerns
+  FileIndexOP kind;
+  std::string path;              // for OP_RENAME the old path, else empty
+  Json::Value data;              // for OP_UPDATE_CFG the change, else null
+};
+
+class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
+ public:
+  OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  OPNode(const OPNode&) = delete;
+  OPNode& operator=(const OPNode&) = delete;
+  ~OPNode();
+
+  // The child named `name` (exact bytes), created and appended when absent.
+  // The node must already be owned by a shared_ptr. Constant time: children
+  // are indexed by name as well as kept in creation order.
+  std::shared_ptr<OPNode> GetChild(const std::string& name);
+
+  // "/a/b" for node b under a under the root; the root's path is empty.
+  std::string GetPath() const;
+
+  // Calls f for each pending op of this node (kind not OP_NONE) in list
+  // order, over a copy of the list: changes f makes do not affect the walk.
+  void TraverseOP(const std::function<void(std::shared_ptr<OP>)>& f);
+
+  const std::string& name() const { return name_; }
+  const std::shared_ptr<OPNode>& parent() const { return parent_; }
+  const std::vector<std::shared_ptr<OPNode>>& children() const { return children_; }
+  std::vector<std::shared_ptr<OP>>& ops() { return ops_; }
+  const std::vector<std::shared_ptr<OP>>& ops() const { return ops_; }
+
+  // Drops the downward links (children and ops) so that a dropped tree
+  // releases its nodes; used only by OPTree's destructor.
+  void ReleaseLinks();
+
+ private:
+  std::string name_;
+  std::shared_ptr<OPNode> parent_;
+  std::vector<std::shared_ptr<OPNode>> children_;
+  std::unordered_map<std::string, OPNode*> child_index_;
+  std::vector<std::shared_ptr<OP>> ops_;
+};
+
+// "[kk] " + (rename: old path + " -> ") + node path + (config: ", data=" + JSON),
+// e.g. "[02] /s/a.txt", "[05] /s/old -> /s/new".
+ORVEX_EXPORT std::ostream& operator<<(std::ostream& out, std::shared_ptr<OP> op);
+// "Node[<path>]: " then each pending op after two blanks; debugging output.
+ORVEX_EXPORT std::ostream& operator<<(std::ostream& out, std::shared_ptr<OPNode> node);
+
+}  // namespace fileindex
+}  // namespace orvex
+
+#endif  // ORVEX_QUEUE_OP_H_

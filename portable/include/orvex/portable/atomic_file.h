@@ -1,0 +1,27 @@
+// Whole-file replacement that never leaves a half-written file: the data goes
+// to a temporary file in the same directory, is flushed to disk and renamed
+// over the target. Readers need no lock: they see the old or the new file.
+// Safe for concurrent use (each call uses its own temporary name).
+#ifndef ORVEX_PORTABLE_ATOMIC_FILE_H_
+#define ORVEX_PORTABLE_ATOMIC_FILE_H_
+
+#include <sys/types.h>
+
+#include <string>
+
+namespace orvex {
+namespace portable {
+
+// Replaces path with data, mode `mode` (before the umask is not applied: the
+// mode is set explicitly). Returns false with errno set on any failure; the
+// old file is then left as it was and no temporary file remains.
+bool WriteFileAtomic(const std::string& path, const std::string& data, mode_t mode = 0644);
+
+// Reads the whole file into data. Returns false with errno set on failure;
+// a directory fails with EISDIR.
+bool ReadWholeFile(const std::string& path, std::string& data);
+
+}  // namespace portable
+}  // namespace orvex
+
+#endif  // ORVEX_PORTABLE_ATOMIC_FILE_H_
