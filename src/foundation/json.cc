@@ -41,7 +41,9 @@ unsigned int asJsonType<unsigned int>(const Json::Value& v) {
 }
 template <>
 bool isJsonType<long long>(const Json::Value& v) {
-  return v.type() == Json::intValue || v.type() == Json::uintValue;
+  // An exact integer type test; an unsigned value past the signed range
+  // cannot be converted and counts as the wrong type.
+  return v.type() == Json::intValue || (v.type() == Json::uintValue && v.isInt64());
 }
 template <>
 long long asJsonType<long long>(const Json::Value& v) {
@@ -67,6 +69,11 @@ Json::Value asJsonType<Json::Value>(const Json::Value& v) {
 std::string AppendData(const Json::Value& obj) { return ", data=" + toString(obj); }
 
 void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
+  // A change made of members can only apply to an object: whatever else
+  // stood there is replaced.
+  if (changes.isObject() && !changes.empty() && !target.isObject()) {
+    target = Json::Value(Json::objectValue);
+  }
   for (auto it = changes.begin(); it != changes.end(); ++it) {
     const std::string key = it.name();
     const Json::Value& value = *it;
@@ -98,6 +105,7 @@ Json::StreamWriter& CompactWriter() {
   thread_local std::unique_ptr<Json::StreamWriter> writer = [] {
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "";
+    builder["commentStyle"] = "None";
     builder["emitUTF8"] = true;
     return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
   }();
@@ -125,6 +133,7 @@ bool fromFile(Json::Value& value, const std::string& path) {
 
 bool toFile(const Json::Value& value, const std::string& path) {
   Json::StreamWriterBuilder builder;
+  builder["commentStyle"] = "None";
   builder["emitUTF8"] = true;
   std::string text = Json::writeString(builder, value);
   text.push_back('\n');
