@@ -11,6 +11,7 @@
 #include <memory>
 #include <ostream>
 #include <string>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -73,16 +74,25 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   std::vector<std::shared_ptr<OP>>& ops() { return ops_; }
   const std::vector<std::shared_ptr<OP>>& ops() const { return ops_; }
 
+  // Attaches op at the end of this node's list. Cancelled ops other than
+  // `keep` (the op of the event being folded in) may be pruned from the list
+  // on the way: they are skipped by every walk and the tree still lists them.
+  void AttachOP(std::shared_ptr<OP> op, const OP* keep);
+  // Removes every occurrence of the given ops from this node's list.
+  void DetachOPs(const std::vector<std::shared_ptr<OP>>& moved);
   // Drops the downward links (children and ops) so that a dropped tree
   // releases its nodes; used only by OPTree's destructor.
   void ReleaseLinks();
 
  private:
+  static constexpr size_t kPruneMinimum = 16;
+
   std::string name_;
   std::shared_ptr<OPNode> parent_;
   std::vector<std::shared_ptr<OPNode>> children_;
-  std::unordered_map<std::string, OPNode*> child_index_;
+  std::unordered_map<std::string_view, OPNode*> child_index_;
   std::vector<std::shared_ptr<OP>> ops_;
+  size_t live_after_prune_ = 0;
 };
 
 // "[kk] " + (rename: old path + " -> ") + node path + (config: ", data=" + JSON),

@@ -74,12 +74,13 @@ class ORVEX_EXPORT OPTree {
   size_t lines_skipped() const { return lines_skipped_; }
 
  private:
+  // Appends op to the tree's list and to node's list.
   void Append(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  // Runs a simple handler: set kind, let `merge` visit the pending ops, append
-  // the op unless it was dropped.
-  void RunSimpleHandler(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op,
-                        FileIndexOP kind, const std::function<void(std::shared_ptr<OP>)>& merge);
-  void ProcessLine(const char* begin, const char* end);
+  // Moves ops to node's list and points them at it; their places in the
+  // tree's list (the processing order) do not change.
+  void MoveOPs(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to,
+               const std::vector<std::shared_ptr<OP>>& moved);
+  void ProcessLine(const std::string& line);
 
   bool crashed_ = false;
   std::string queue_path_;
@@ -87,6 +88,9 @@ class ORVEX_EXPORT OPTree {
   std::vector<std::shared_ptr<OP>> ops_;
   size_t lines_read_ = 0;
   size_t lines_skipped_ = 0;
+  // The op of the event being folded in: the one cancelled op that may still
+  // be revived (by a later bit of the same event), so it is never pruned.
+  const OP* in_flight_ = nullptr;
 };
 
 }  // namespace fileindex

@@ -1,0 +1,134 @@
+#include "orvex/queue/op.h"
+
+#include <algorithm>
+#include <cstring>
+#include <iomanip>
+#include <unordered_set>
+#include <utility>
+
+#include "orvex/foundation/json.h"
+
+namespace orvex {
+namespace fileindex {
+
+OP::OP(std::shared_ptr<OPNode> node_in, FileIndexOP kind_in, const std::string& path_in,
+       const Json::Value& data_in)
+    : node(std::move(node_in)), kind(kind_in), path(path_in), data(data_in) {}
+
+void OP::MergeData(const Json::Value& other) {
+  // A change that is not an object carries no file-type flags; start from an
+  // empty object so that the flags can be set.
+  if (!data.isObject()) data = Json::Value(Json::objectValue);
+  for (const char* key : {"document", "audio", "video", "photo"}) {
+    const Json::Value* incoming = other.isObject() ? other.find(key, key + strlen(key)) : nullptr;
+    const bool enable = incoming != nullptr && incoming->isBool() && incoming->asBool();
+    const Json::Value& current = data[key];
+    data[key] = enable || (current.isBool() && current.asBool());
+  }
+}
+
+OPNode::OPNode(std::shared_ptr<OPNode> parent, const std::string& name)
+    : name_(name), parent_(std::move(parent)) {}
+
+OPNode::~OPNode() {
+  // Release the chain of parents iteratively: a node held only by its child
+  // (after the tree is gone) would otherwise free its ancestors recursively,
+  // one stack frame per path component.
+  std::shared_ptr<OPNode> up = std::move(parent_);
+  while (up && up.use_count() == 1) {
+    std::shared_ptr<OPNode> next = std::move(up->parent_);
+    up = std::move(next);
+  }
+}
+
+std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
+  auto found = child_index_.find(name);
+  if (found != child_index_.end()) return found->second->shared_from_this();
+  auto child = std::make_shared<OPNode>(shared_from_this(), name);
+  children_.push_back(child);
+  // The key views the child's own name, which never changes.
+  child_index_.emplace(std::string_view(child->name_), child.get());
+  return child;
+}
+
+std::string OPNode::GetPath() const {
+  std::vector<const OPNode*> chain;
+  size_t length = 0;
+  for (const OPNode* node = this; node->parent_ != nullptr; node = node->parent_.get()) {
+    chain.push_back(node);
+    length += node->name_.size() + 1;
+  }
+  std::string path;
+  path.reserve(length);
+  for (auto it = chain.rbegin(); it != chain.rend(); ++it) {
+    path.push_back('/');
+    path += (*it)->name_;
+  }
+  // A parentless node that is not the tree's root still reports its name.
+  if (chain.empty()) return name_;
+  return path;
+}
+
+void OPNode::TraverseOP(const std::function<void(std::shared_ptr<OP>)>& f) {
+  // Walk a copy: f may append to or remove from this list. Entries cancelled
+  // by the time they are reached are skipped; a cancelled op never revives
+  // during a walk, so cancelled entries need not be copied at all.
+  std::vector<std::shared_ptr<OP>> pending;
+  pending.reserve(ops_.size());
+  for (const auto& op : ops_) {
+    if (op->kind != OP_NONE) pending.push_back(op);
+  }
+  for (auto& op : pending) {
+    if (op->kind != OP_NONE) f(op);
+  }
+}
+
+void OPNode::AttachOP(std::shared_ptr<OP> op, const OP* keep) {
+  ops_.push_back(std::move(op));
+  if (ops_.size() < kPruneMinimum || ops_.size() < 2 * live_after_prune_) return;
+  // Cancelled ops are skipped by every walk and never revive once their event
+  // is folded in, so the node may forget them (the tree's list keeps them).
+  // Pruning when the list has doubled keeps appends amortised constant and a
+  // churning path from growing its list without bound.
+  ops_.erase(std::remove_if(ops_.begin(), ops_.end(),
+                            [keep](const std::shared_ptr<OP>& e) {
+                              return e->kind == OP_NONE && e.get() != keep;
+                            }),
+             ops_.end());
+  live_after_prune_ = ops_.size();
+}
+
+void OPNode::DetachOPs(const std::vector<std::shared_ptr<OP>>& moved) {
+  if (moved.empty()) return;
+  std::unordered_set<const OP*> gone;
+  for (const auto& op : moved) gone.insert(op.get());
+  ops_.erase(std::remove_if(ops_.begin(), ops_.end(),
+                            [&gone](const std::shared_ptr<OP>& e) { return gone.count(e.get()); }),
+             ops_.end());
+}
+
+void OPNode::ReleaseLinks() {
+  children_.clear();
+  child_index_.clear();
+  ops_.clear();
+}
+
+std::ostream& operator<<(std::ostream& out, std::shared_ptr<OP> op) {
+  const char fill = out.fill('0');
+  out << '[' << std::setw(2) << static_cast<int>(op->kind);
+  out.fill(fill);
+  out << "] ";
+  if (op->kind == OP_RENAME) out << op->path << " -> ";
+  if (op->node) out << op->node->GetPath();
+  if (op->kind == OP_UPDATE_CFG) out << ", data=" << toString(op->data);
+  return out;
+}
+
+std::ostream& operator<<(std::ostream& out, std::shared_ptr<OPNode> node) {
+  out << "Node[" << node->GetPath() << "]: ";
+  for (const auto& op : node->ops()) out << "\n  " << op;
+  return out;
+}
+
+}  // namespace fileindex
+}  // namespace orvex

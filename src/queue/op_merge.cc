@@ -1,0 +1,263 @@
+// The merge rules: how a new event folds into the operations already pending
+// on its path, its ancestors and its descendants. The rules are deliberately
+// asymmetric (a modify after a pending delete is absorbed, a create after one
+// revives the file) and must be kept exactly as they are.
+#include <unordered_set>
+
+#include "orvex/queue/op_tree.h"
+
+namespace orvex {
+namespace fileindex {
+namespace {
+
+// What a simple handler does to the new op and to one pending op e.
+enum class Action {
+  kNothing,  // both stay: the new op is appended after e
+  kDrop,     // the new op is absorbed by e
+  kUpgrade,  // e takes the rule's kind; the new op is absorbed
+  kReplace,  // e becomes a configuration update with the new data; absorbed
+  kMerge,    // e's configuration merges the new data; absorbed
+};
+
+struct Rule {
+  Action action;
+  FileIndexOP upgrade_to;
+};
+
+constexpr Rule Nothing() { return {Action::kNothing, OP_NONE}; }
+constexpr Rule Drop() { return {Action::kDrop, OP_NONE}; }
+constexpr Rule Upgrade(FileIndexOP kind) { return {Action::kUpgrade, kind}; }
+constexpr Rule Replace() { return {Action::kReplace, OP_UPDATE_CFG}; }
+constexpr Rule Merge() { return {Action::kMerge, OP_UPDATE_CFG}; }
+
+// One row per incoming kind; columns are the pending op's kind:
+//                        DELETE               UPSERT             ATTR
+//                        UPDATE_CFG           RENAME             REINDEX
+using RuleRow = Rule[6];
+constexpr RuleRow kCreateRules = {Upgrade(OP_UPSERT), Drop(), Upgrade(OP_UPSERT),
+                                  Drop(), Nothing(), Drop()};
+constexpr RuleRow kModifyRules = {Drop(), Drop(), Upgrade(OP_UPSERT),
+                                  Drop(), Nothing(), Drop()};
+constexpr RuleRow kAttrRules = {Drop(), Drop(), Drop(),
+                                Drop(), Nothing(), Drop()};
+constexpr RuleRow kDeleteRules = {Drop(), Upgrade(OP_DELETE), Upgrade(OP_DELETE),
+                                  Nothing(), Nothing(), Nothing()};
+constexpr RuleRow kUpdateCfgRules = {Drop(), Replace(), Replace(),
+                                     Merge(), Nothing(), Drop()};
+
+void ApplyRule(const Rule& rule, OP& incoming, OP& pending) {
+  switch (rule.action) {
+    case Action::kNothing:
+      return;
+    case Action::kDrop:
+      break;
+    case Action::kUpgrade:
+      pending.kind = rule.upgrade_to;
+      break;
+    case Action::kReplace:
+      pending.kind = OP_UPDATE_CFG;
+      pending.data = incoming.data;
+      break;
+    case Action::kMerge:
+      pending.MergeData(incoming.data);
+      break;
+  }
+  incoming.kind = OP_NONE;
+}
+
+bool IsMergeable(FileIndexOP kind) { return kind >= OP_DELETE && kind <= OP_REINDEX; }
+
+// Sets the new op's kind, folds it against every pending op of the node by
+// the row's rules, and appends it unless it was absorbed.
+template <typename AppendFn>
+void RunSimpleHandler(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op,
+                      FileIndexOP kind, const RuleRow& rules, AppendFn append) {
+  op->kind = kind;
+  node->TraverseOP([&](std::shared_ptr<OP> e) {
+    if (IsMergeable(e->kind)) ApplyRule(rules[e->kind - OP_DELETE], *op, *e);
+  });
+  if (op->kind != OP_NONE) append(node, op);
+}
+
+// Clears in_flight on every way out of InsertEvent.
+class InFlight {
+ public:
+  InFlight(const OP*& slot, const OP* op) : slot_(slot) { slot_ = op; }
+  InFlight(const InFlight&) = delete;
+  InFlight& operator=(const InFlight&) = delete;
+  ~InFlight() { slot_ = nullptr; }
+
+ private:
+  const OP*& slot_;
+};
+
+// Visits every descendant d of `source` in the order of
+// OPTree::TraverseNodeDescendant (post-order, children copied on entry) and
+// calls f(d, d') where d' is the node of d's path with the source's path
+// replaced by the target's. d' is found, and created if missing, at the
+// moment d is visited, top-down from the target, exactly as a lookup of the
+// rewritten path from the root would; but each counterpart is found once and
+// remembered, so a deep subtree costs time linear in its size rather than
+// one walk from the root per node.
+template <typename Fn>
+void FollowRename(const std::shared_ptr<OPNode>& source, const std::shared_ptr<OPNode>& target,
+                  Fn f) {
+  struct Frame {
+    std::shared_ptr<OPNode> node;
+    std::vector<std::shared_ptr<OPNode>> children;
+    size_t next;
+    std::shared_ptr<OPNode> counterpart;  // empty until first needed
+  };
+  std::vector<Frame> stack;
+  stack.push_back(Frame{source, source->children(), 0, target});
+  auto counterpart_of = [&stack](size_t index) {
+    size_t known = index;
+    while (!stack[known].counterpart) --known;  // the bottom frame always has one
+    for (size_t i = known + 1; i <= index; ++i) {
+      stack[i].counterpart = stack[i - 1].counterpart->GetChild(stack[i].node->name());
+    }
+    return stack[index].counterpart;
+  };
+  while (stack.size() > 1 || stack.back().next < stack.back().children.size()) {
+    Frame& top = stack.back();
+    if (top.next < top.children.size()) {
+      std::shared_ptr<OPNode> child = top.children[top.next++];
+      std::vector<std::shared_ptr<OPNode>> grandchildren = child->children();
+      stack.push_back(Frame{std::move(child), std::move(grandchildren), 0, nullptr});
+      continue;
+    }
+    std::shared_ptr<OPNode> to = counterpart_of(stack.size() - 1);
+    std::shared_ptr<OPNode> from = std::move(top.node);
+    stack.pop_back();
+    f(from, to);
+  }
+}
+
+}  // namespace
+
+void OPTree::InsertEvent(std::shared_ptr<Event> ev) {
+  std::shared_ptr<OPNode> node = GetNodeByPath(ev->path);
+  // One op object for every bit of the event: a mask with several bits runs
+  // several handlers on it, which can revive or absorb it in turn.
+  auto op = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+  InFlight in_flight(in_flight_, op.get());
+  const uint32_t mask = ev->event;
+  if (mask & EVENT_CREATE) {
+    ev->is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
+  }
+  if (mask & EVENT_ATTR) HandleAttr(node, op);
+  if (mask & EVENT_MODIFY) HandleModify(node, op);
+  if (mask & EVENT_DELETE) {
+    // A deleted directory is rescanned: the consumer drops what is gone.
+    ev->is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
+  }
+  if (mask & EVENT_RENAME) {
+    op->path = ev->path_old;
+    HandleRename(node, op);
+  }
+  if (mask & EVENT_REINDEX) HandleReindex(node, op);
+  if (mask & EVENT_UPDATE_CFG) {
+    op->data = ev->data;
+    HandleUpdateCfg(node, op);
+  }
+  if (mask & EVENT_QUEUE_CRASHED) crashed_ = true;
+}
+
+void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  RunSimpleHandler(node, op, OP_UPSERT, kCreateRules,
+                   [this](const auto& n, const auto& o) { Append(n, o); });
+}
+
+void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  RunSimpleHandler(node, op, OP_UPSERT, kModifyRules,
+                   [this](const auto& n, const auto& o) { Append(n, o); });
+}
+
+void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  RunSimpleHandler(node, op, OP_ATTR, kAttrRules,
+                   [this](const auto& n, const auto& o) { Append(n, o); });
+}
+
+void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  RunSimpleHandler(node, op, OP_DELETE, kDeleteRules,
+                   [this](const auto& n, const auto& o) { Append(n, o); });
+}
+
+void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  RunSimpleHandler(node, op, OP_UPDATE_CFG, kUpdateCfgRules,
+                   [this](const auto& n, const auto& o) { Append(n, o); });
+}
+
+void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  op->kind = OP_REINDEX;
+  node->TraverseOP([&op](std::shared_ptr<OP> e) {
+    switch (e->kind) {
+      case OP_DELETE:
+      case OP_REINDEX:
+        op->kind = OP_NONE;
+        break;
+      case OP_UPSERT:
+      case OP_ATTR:
+      case OP_UPDATE_CFG:
+        e->kind = OP_REINDEX;  // its data stays as it was
+        op->kind = OP_NONE;
+        break;
+      default:
+        break;
+    }
+  });
+  // Everything pending below is covered by the reindex, except renames,
+  // which the index still has to carry out. Runs even when the new op was
+  // absorbed above.
+  TraverseNodeDescendant(
+      node,
+      [](std::shared_ptr<OPNode> descendant) {
+        descendant->TraverseOP([](std::shared_ptr<OP> e) {
+          if (e->kind != OP_RENAME) e->kind = OP_NONE;
+        });
+      },
+      /*skip_self=*/true);
+  if (op->kind != OP_NONE) Append(node, op);
+}
+
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  const std::string old_path = op->path;
+  const std::string new_path = node->GetPath();
+  std::shared_ptr<OPNode> old_node = GetNodeByPath(old_path);
+  // Carries what the source still needed (an upsert, attribute refresh or
+  // reindex) to the new path, after the rename itself.
+  auto extra = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+  op->kind = OP_RENAME;
+
+  // The target's own pending content changes are superseded by what moves in.
+  node->TraverseOP([](std::shared_ptr<OP> e) {
+    if (e->kind == OP_DELETE || e->kind == OP_UPSERT || e->kind == OP_ATTR) e->kind = OP_NONE;
+  });
+
+  std::vector<std::shared_ptr<OP>> moved;
+  old_node->TraverseOP([&](std::shared_ptr<OP> e) {
+    if (e->kind == OP_UPSERT || e->kind == OP_ATTR || e->kind == OP_REINDEX) {
+      extra->kind = e->kind;  // the last such op wins
+      e->kind = OP_NONE;
+    }
+    moved.push_back(std::move(e));
+  });
+  MoveOPs(old_node, node, moved);
+
+  // Pending work below the source follows it to the new path, keeping its
+  // place in the processing order; deletes stay where the files were.
+  FollowRename(old_node, node, [this](const std::shared_ptr<OPNode>& from,
+                                      const std::shared_ptr<OPNode>& to) {
+    std::vector<std::shared_ptr<OP>> following;
+    from->TraverseOP([&following](std::shared_ptr<OP> e) {
+      if (e->kind != OP_DELETE) following.push_back(std::move(e));
+    });
+    MoveOPs(from, to, following);
+  });
+
+  Append(node, op);
+  if (extra->kind != OP_NONE) Append(node, extra);
+}
+
+}  // namespace fileindex
+}  // namespace orvex

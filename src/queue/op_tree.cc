@@ -1,0 +1,142 @@
+#include "orvex/queue/op_tree.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "foundation/check.h"
+#include "orvex/foundation/log.h"
+#include "queue/line_reader.h"
+
+namespace orvex {
+namespace fileindex {
+namespace {
+
+constexpr char kLogSource[] = "optree";
+
+}  // namespace
+
+OPTree::OPTree(const std::string& queue_path)
+    : queue_path_(queue_path), root_(std::make_shared<OPNode>(nullptr, "")) {
+  BuildTree();
+}
+
+OPTree::~OPTree() {
+  // Nodes link to their parents and ops to their nodes with owning pointers,
+  // and nodes own their children and ops: cut the downward links, then free
+  // the nodes deepest first so no destructor recurses down a long path.
+  ops_.clear();
+  std::vector<std::shared_ptr<OPNode>> nodes{root_};
+  for (size_t i = 0; i < nodes.size(); ++i) {
+    for (const auto& child : nodes[i]->children()) nodes.push_back(child);
+  }
+  for (const auto& node : nodes) node->ReleaseLinks();
+  root_.reset();
+  while (!nodes.empty()) nodes.pop_back();
+}
+
+void OPTree::BuildTree() {
+  LineReader reader(queue_path_);
+  ORVEX_CHECK_AS(!reader.ok(), "!input_stream", kErrorSystem,
+                 "Failed to open queue, reason=" + std::string(strerror(errno)));
+  std::string line;
+  while (!crashed_ && reader.Next(line)) ProcessLine(line);
+}
+
+void OPTree::ProcessLine(const std::string& line) {
+  ++lines_read_;
+  if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.c_str());
+  try {
+    InsertEvent(std::make_shared<Event>(line));
+  } catch (const Error& e) {
+    ++lines_skipped_;
+    LogErrno("%s:%d (%d, %u) InsertEvent failed, event_raw=%s, code=%d, reason=%s", kLogSource,
+             __LINE__, static_cast<int>(::getpid()), static_cast<unsigned>(::geteuid()),
+             line.c_str(), static_cast<int>(e.code()), e.reason().c_str());
+  }
+}
+
+std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+  // Walks the non-empty components from the root, creating nodes. The node
+  // reached matches the path byte for byte only when the path is canonical:
+  // absolute, with no empty component and no trailing slash.
+  std::shared_ptr<OPNode> node = root_;
+  bool canonical = path.size() > 1 && path.front() == '/' && path.back() != '/';
+  std::string component;
+  size_t pos = 0;
+  while (pos < path.size()) {
+    size_t next = path.find('/', pos);
+    if (next == std::string::npos) next = path.size();
+    if (next > pos) {
+      component.assign(path, pos, next - pos);
+      node = node->GetChild(component);
+    } else if (pos != 0) {
+      canonical = false;  // "//"
+    }
+    pos = next + 1;
+  }
+  if (!canonical) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
+  return node;
+}
+
+void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
+                                    const std::function<void(std::shared_ptr<OPNode>)>& f,
+                                    bool skip_self) {
+  // The recursive walk, with an explicit stack: each node's children are
+  // copied as it is entered, so nodes that f creates below a node already
+  // entered are not visited.
+  struct Frame {
+    std::shared_ptr<OPNode> node;
+    std::vector<std::shared_ptr<OPNode>> children;
+    size_t next;
+    bool visit;
+  };
+  std::vector<Frame> stack;
+  stack.push_back(Frame{node, node->children(), 0, !skip_self});
+  while (!stack.empty()) {
+    Frame& top = stack.back();
+    if (top.next < top.children.size()) {
+      std::shared_ptr<OPNode> child = top.children[top.next++];
+      std::vector<std::shared_ptr<OPNode>> grandchildren = child->children();
+      stack.push_back(Frame{std::move(child), std::move(grandchildren), 0, true});
+      continue;
+    }
+    std::shared_ptr<OPNode> done = std::move(top.node);
+    bool visit = top.visit;
+    stack.pop_back();
+    if (visit) f(std::move(done));
+  }
+}
+
+int OPTree::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& f) {
+  if (crashed_) {
+    LogPlain("%s:%d Queue crashed: %s", kLogSource, __LINE__, queue_path_.c_str());
+    f(std::make_shared<OP>(root_, OP_QUEUE_CRASHED, "", Json::Value()));
+    return 1;
+  }
+  for (size_t i = 0; i < ops_.size(); ++i) {
+    std::shared_ptr<OP> op = ops_[i];
+    if (op->kind != OP_NONE) f(std::move(op));
+  }
+  return static_cast<int>(ops_.size());
+}
+
+void OPTree::Append(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+  ops_.push_back(op);
+  node->AttachOP(op, in_flight_);
+}
+
+void OPTree::MoveOPs(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to,
+                     const std::vector<std::shared_ptr<OP>>& moved) {
+  for (const auto& op : moved) {
+    to->AttachOP(op, in_flight_);
+    op->node = to;
+  }
+  // Every occurrence leaves the source, also when source and target are the
+  // same node.
+  from->DetachOPs(moved);
+}
+
+}  // namespace fileindex
+}  // namespace orvex
