@@ -6,7 +6,9 @@
 
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
+#include "orvex/foundation/lock.h"
 #include "orvex/foundation/log.h"
 #include "orvex/foundation/system_hooks.h"
+#include "orvex/foundation/util.h"
 
 #endif  // ORVEX_FOUNDATION_H_
