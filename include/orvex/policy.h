@@ -1,0 +1,10 @@
+// Path policy and file classification: share path helpers, the indexability
+// rules for folders and the classification of files by extension.
+#ifndef ORVEX_POLICY_H_
+#define ORVEX_POLICY_H_
+
+#include "orvex/policy/file_type.h"
+#include "orvex/policy/indexability.h"
+#include "orvex/policy/share_path.h"
+
+#endif  // ORVEX_POLICY_H_
