@@ -4,9 +4,25 @@
 
 #include <sstream>
 
+#include "orvex/queue/op_tree.h"
+#include "support/temp_dir.h"
+
 namespace orvex {
 namespace fileindex {
 namespace {
+
+// Nodes link both ways; a tree (built from an empty queue) owns them and
+// releases the links when the test ends.
+class NodeTest : public ::testing::Test {
+ protected:
+  NodeTest() : tree_(dir_.Write("queue", "")) {}
+  std::shared_ptr<OPNode> root() { return tree_.root(); }
+
+  testing::TempDir dir_;
+  OPTree tree_;
+};
+using OPNodeTest = NodeTest;
+using OPTest = NodeTest;
 
 std::string Print(const std::shared_ptr<OP>& op) {
   std::ostringstream out;
@@ -14,8 +30,8 @@ std::string Print(const std::shared_ptr<OP>& op) {
   return out.str();
 }
 
-TEST(OPNodeTest, PathsAndChildren) {
-  auto root = std::make_shared<OPNode>(nullptr, "");
+TEST_F(OPNodeTest, PathsAndChildren) {
+  auto root = this->root();
   EXPECT_EQ(root->GetPath(), "");
   auto v = root->GetChild("v");
   EXPECT_EQ(v->GetPath(), "/v");
@@ -25,16 +41,16 @@ TEST(OPNodeTest, PathsAndChildren) {
   EXPECT_EQ(v->children().size(), 1u);
 }
 
-TEST(OPNodeTest, ChildrenKeepCreationOrderAndExactNames) {
-  auto root = std::make_shared<OPNode>(nullptr, "");
+TEST_F(OPNodeTest, ChildrenKeepCreationOrderAndExactNames) {
+  auto root = this->root();
   for (const char* name : {"b", "a", "B", "é", "a "}) root->GetChild(name);
   std::vector<std::string> names;
   for (const auto& child : root->children()) names.push_back(child->name());
   EXPECT_EQ(names, (std::vector<std::string>{"b", "a", "B", "é", "a "}));
 }
 
-TEST(OPNodeTest, TraverseOPSkipsCancelledAndIgnoresChangesDuringTheWalk) {
-  auto root = std::make_shared<OPNode>(nullptr, "");
+TEST_F(OPNodeTest, TraverseOPSkipsCancelledAndIgnoresChangesDuringTheWalk) {
+  auto root = this->root();
   auto node = root->GetChild("f");
   auto live = std::make_shared<OP>(node, OP_UPSERT, "", Json::Value());
   auto cancelled = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
@@ -50,7 +66,7 @@ TEST(OPNodeTest, TraverseOPSkipsCancelledAndIgnoresChangesDuringTheWalk) {
   EXPECT_EQ(node->ops().size(), 4u);
 }
 
-TEST(OPTest, MergeDataKeepsEveryEnabledClass) {
+TEST_F(OPTest, MergeDataKeepsEveryEnabledClass) {
   auto op = std::make_shared<OP>(nullptr, OP_UPDATE_CFG, "", Json::Value());
   Json::Value mine;
   mine["document"] = false;
@@ -69,7 +85,7 @@ TEST(OPTest, MergeDataKeepsEveryEnabledClass) {
   EXPECT_EQ(op->data["extra"].asString(), "kept");
 }
 
-TEST(OPTest, MergeDataOnANonObjectChangeDoesNotThrow) {
+TEST_F(OPTest, MergeDataOnANonObjectChangeDoesNotThrow) {
   auto op = std::make_shared<OP>(nullptr, OP_UPDATE_CFG, "", Json::Value("text"));
   Json::Value other;
   other["photo"] = true;
@@ -79,8 +95,8 @@ TEST(OPTest, MergeDataOnANonObjectChangeDoesNotThrow) {
   EXPECT_TRUE(op->data["photo"].asBool());
 }
 
-TEST(OPTest, PrinterFormats) {
-  auto root = std::make_shared<OPNode>(nullptr, "");
+TEST_F(OPTest, PrinterFormats) {
+  auto root = this->root();
   auto file = root->GetChild("s")->GetChild("a.txt");
   EXPECT_EQ(Print(std::make_shared<OP>(file, OP_UPSERT, "", Json::Value())), "[02] /s/a.txt");
   EXPECT_EQ(Print(std::make_shared<OP>(file, OP_RENAME, "/s/old", Json::Value())),
@@ -92,8 +108,8 @@ TEST(OPTest, PrinterFormats) {
   EXPECT_EQ(Print(std::make_shared<OP>(root, OP_QUEUE_CRASHED, "", Json::Value())), "[07] ");
 }
 
-TEST(OPTest, PrinterLeavesTheStreamFillAsItWas) {
-  auto root = std::make_shared<OPNode>(nullptr, "");
+TEST_F(OPTest, PrinterLeavesTheStreamFillAsItWas) {
+  auto root = this->root();
   std::ostringstream out;
   out << std::make_shared<OP>(root->GetChild("x"), OP_DELETE, "", Json::Value());
   out.width(3);
