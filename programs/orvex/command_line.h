@@ -1,0 +1,69 @@
+// What the orvex tool's command groups share: the group entry points listed
+// in main.cc's command table, the usage error, and the small argument parser.
+// The tool is single-threaded.
+#ifndef ORVEX_PROGRAMS_ORVEX_COMMAND_LINE_H_
+#define ORVEX_PROGRAMS_ORVEX_COMMAND_LINE_H_
+
+#include <set>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+namespace orvex_cli {
+
+constexpr int kExitOk = 0;
+// Every failure, bad usage included, exits with this status.
+constexpr int kExitFailure = 2;
+
+using Args = std::vector<std::string>;
+
+// Bad usage of a command: main prints "orvex: <message>", then usage, to
+// standard error and exits with kExitFailure.
+class UsageError : public std::runtime_error {
+ public:
+  UsageError(const std::string& message, std::string usage)
+      : std::runtime_error(message), usage_(std::move(usage)) {}
+  const std::string& usage() const { return usage_; }
+
+ private:
+  std::string usage_;
+};
+
+// One command group: `orvex <name> ...`. run receives the arguments after
+// the name, prints its own help when they hold "--help", and returns the exit
+// status or throws (UsageError, orvex::Error, std::exception) for main to
+// report.
+struct CommandGroup {
+  const char* name;
+  const char* summary;  // one line for `orvex --help`
+  int (*run)(const Args& args);
+};
+
+// Entry points, one group per file (see the command table in main.cc).
+int RunShareCommand(const Args& args);   // share_commands.cc
+int RunStatusCommand(const Args& args);  // status_commands.cc
+int RunPauseCommand(const Args& args);   // status_commands.cc
+int RunResumeCommand(const Args& args);  // status_commands.cc
+
+// Arguments split into options ("--name") and positional words. "--" ends
+// the options; a word such as "-2" is positional, so that numbers may be
+// negative and reach the library's own check.
+struct ParsedArgs {
+  std::vector<std::string> positional;
+  std::set<std::string> options;
+
+  bool Has(const std::string& option) const { return options.count(option) != 0; }
+};
+
+// True when args hold "--help" before any "--".
+bool WantsHelp(const Args& args);
+
+// Parses args, allowing only the given options and between min_positional and
+// max_positional positional words. Throws UsageError (carrying usage)
+// otherwise.
+ParsedArgs ParseArgs(const Args& args, const std::set<std::string>& allowed, size_t min_positional,
+                     size_t max_positional, const std::string& usage);
+
+}  // namespace orvex_cli
+
+#endif  // ORVEX_PROGRAMS_ORVEX_COMMAND_LINE_H_

@@ -1,0 +1,86 @@
+// orvex: the administrator's command-line tool for the file index. It manages
+// the share registry, shows the index status, and pauses or resumes indexing
+// (telling the indexing daemon at once). Fixed paths follow ORVEX_ROOT like
+// everything else in the system.
+#include <iostream>
+#include <string>
+
+#include "command_line.h"
+#include "orvex/foundation/error.h"
+
+namespace orvex_cli {
+namespace {
+
+// The command table. To add a command group, say `orvex folder ...`:
+//   1. write folder_commands.cc in this directory defining
+//      `int RunFolderCommand(const Args& args)`: it gets the words after
+//      "folder", prints its help for "--help", returns kExitOk, and throws
+//      UsageError, orvex::Error or std::exception on failure (main reports
+//      them and exits with kExitFailure);
+//   2. declare it in command_line.h beside the others;
+//   3. add one line {"folder", "<one-line summary>", RunFolderCommand} below.
+// The build picks the new file up by itself.
+const CommandGroup kCommands[] = {
+    {"share", "add, list and remove shares in the share registry", RunShareCommand},
+    {"status", "show whether indexing is paused and each share's status", RunStatusCommand},
+    {"pause", "pause indexing for HOURS hours, or with no end", RunPauseCommand},
+    {"resume", "resume indexing", RunResumeCommand},
+};
+
+std::string Usage() {
+  std::string usage =
+      "usage: orvex COMMAND [ARGS...]\n"
+      "Manages the Orvex file index. Run `orvex COMMAND --help` for a command's help.\n"
+      "Commands:\n";
+  for (const CommandGroup& group : kCommands) {
+    std::string name = group.name;
+    name.resize(8, ' ');
+    usage += "  " + name + "  " + group.summary + "\n";
+  }
+  usage +=
+      "Fixed paths (share registry, status file, daemon socket) are taken under\n"
+      "$ORVEX_ROOT when it is set.\n"
+      "Exit status: 0 on success, 2 on any failure or bad usage.\n";
+  return usage;
+}
+
+const CommandGroup* FindGroup(const std::string& name) {
+  for (const CommandGroup& group : kCommands) {
+    if (name == group.name) return &group;
+  }
+  return nullptr;
+}
+
+int Dispatch(const Args& args) {
+  if (args.empty()) throw UsageError("missing command", Usage());
+  if (args[0] == "--help") {
+    std::cout << Usage();
+    return kExitOk;
+  }
+  const CommandGroup* group = FindGroup(args[0]);
+  if (group == nullptr) throw UsageError("unknown command " + args[0], Usage());
+  return group->run(Args(args.begin() + 1, args.end()));
+}
+
+// Exceptions stop here: each becomes one line on standard error.
+int Main(const Args& args) {
+  try {
+    return Dispatch(args);
+  } catch (const UsageError& e) {
+    std::cerr << "orvex: " << e.what() << "\n" << e.usage();
+  } catch (const orvex::Error& e) {
+    std::cerr << "orvex: error " << e.code() << ": " << e.reason() << "\n";
+  } catch (const std::exception& e) {
+    std::cerr << "orvex: " << e.what() << "\n";
+  }
+  return kExitFailure;
+}
+
+}  // namespace
+}  // namespace orvex_cli
+
+int main(int argc, char** argv) {
+  const int status = orvex_cli::Main(orvex_cli::Args(argv + 1, argv + argc));
+  std::cout.flush();
+  return std::cout ? status : orvex_cli::kExitFailure;
+}
