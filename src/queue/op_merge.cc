@@ -2,8 +2,8 @@
 // on its path, its ancestors and its descendants. The rules are deliberately
 // asymmetric (a modify after a pending delete is absorbed, a create after one
 // revives the file) and must be kept exactly as they are.
-#include <unordered_set>
 
+#include "orvex/foundation/error.h"
 #include "orvex/queue/op_tree.h"
 
 namespace orvex {
@@ -223,6 +223,13 @@ void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op)
 void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
   const std::string old_path = op->path;
   const std::string new_path = node->GetPath();
+  // No file system can move a directory into itself. Following such a line
+  // would copy the source's subtree into itself, doubling it with every
+  // repetition, so the line is refused before anything changes.
+  if (new_path.size() > old_path.size() && new_path.compare(0, old_path.size(), old_path) == 0 &&
+      new_path[old_path.size()] == '/') {
+    throw Error(kErrorBadArgument, "Rename into its own subtree: " + old_path + " -> " + new_path);
+  }
   std::shared_ptr<OPNode> old_node = GetNodeByPath(old_path);
   // Carries what the source still needed (an upsert, attribute refresh or
   // reindex) to the new path, after the rename itself.
