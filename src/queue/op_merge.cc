@@ -226,8 +226,9 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   // No file system can move a directory into itself. Following such a line
   // would copy the source's subtree into itself, doubling it with every
   // repetition, so the line is refused before anything changes.
-  if (new_path.size() > old_path.size() && new_path.compare(0, old_path.size(), old_path) == 0 &&
-      new_path[old_path.size()] == '/') {
+  // (An empty old path is no directory at all: the lookup below refuses it.)
+  if (!old_path.empty() && new_path.size() > old_path.size() &&
+      new_path.compare(0, old_path.size(), old_path) == 0 && new_path[old_path.size()] == '/') {
     throw Error(kErrorBadArgument, "Rename into its own subtree: " + old_path + " -> " + new_path);
   }
   std::shared_ptr<OPNode> old_node = GetNodeByPath(old_path);

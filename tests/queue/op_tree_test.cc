@@ -268,6 +268,7 @@ TEST_F(OPTreeTest, BadLinesAreLoggedAndSkipped) {
   ASSERT_EQ(failures.size(), 5u);
   EXPECT_NE(failures[1].find("code=9999, reason=GetNodeByPath failed, path=/"), std::string::npos);
   EXPECT_NE(failures[0].find("code=906, reason=Malformed event_raw: not json"), std::string::npos);
+  EXPECT_NE(failures[4].find("code=9999, reason=GetNodeByPath failed, path="), std::string::npos);
   std::vector<std::string> out;
   tree->ProcessOP([&out](std::shared_ptr<OP> op) { out.push_back(op->node->GetPath()); });
   // The rename with no old path appended nothing before failing.
