@@ -104,7 +104,7 @@ function(orvex_tests)
           ORVEX_BUILD_DIR="${PROJECT_BINARY_DIR}"
           ORVEX_SOURCE_DIR="${PROJECT_SOURCE_DIR}")
         gtest_discover_tests(${part}_tests DISCOVERY_TIMEOUT 60
-                             PROPERTIES ENVIRONMENT "ORVEX_ROOT=")
+                             PROPERTIES ENVIRONMENT "ORVEX_ROOT=" TIMEOUT 120)
       endif()
     endif()
   endforeach()

@@ -229,6 +229,11 @@ TEST_F(SendCommandTest, LeavesSigpipeIgnored) {
 }
 
 TEST_F(SendCommandTest, SocketCreationFailureIsLoggedAndThrown) {
+#if defined(__SANITIZE_ADDRESS__)
+  // The sanitizers' own checks open descriptors (a pipe to probe memory);
+  // with none left they report false errors.
+  GTEST_SKIP() << "needs free descriptors under the sanitizers";
+#endif
   // Lower the descriptor limit to the next free number so socket() fails.
   struct rlimit saved;
   ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &saved), 0);
