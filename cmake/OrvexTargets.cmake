@@ -3,6 +3,7 @@
 # no test can be silently dropped from the build.
 
 set(ORVEX_SUBSYSTEMS "" CACHE INTERNAL "")
+set(ORVEX_PROGRAMS "" CACHE INTERNAL "")
 set(ORVEX_STATIC_LIBS "" CACHE INTERNAL "")
 
 # A static internal library from every .cc of DIR; an empty placeholder
@@ -72,9 +73,16 @@ function(orvex_programs)
       file(GLOB srcs CONFIGURE_DEPENDS ${dir}/*.cc)
       if(srcs)
         add_executable(${prog} ${srcs})
+        set(ORVEX_PROGRAMS "${ORVEX_PROGRAMS};${prog}" CACHE INTERNAL "")
         target_link_libraries(${prog} PRIVATE ${libs})
         target_include_directories(${prog} PRIVATE ${PROJECT_SOURCE_DIR}/src)
-        install(TARGETS ${prog} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+        if(prog STREQUAL "kalopmxnotify")
+          # The library runs the notification tool from the platform's own
+          # fixed place (under ORVEX_ROOT when that is set).
+          install(TARGETS ${prog} RUNTIME DESTINATION /usr/kalo/bin)
+        else()
+          install(TARGETS ${prog} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+        endif()
       endif()
     endif()
   endforeach()
@@ -98,6 +106,12 @@ function(orvex_tests)
           set(part_libs ${libs})
         endif()
         target_link_libraries(${part}_tests PRIVATE ${part_libs} GTest::gtest_main GTest::gmock)
+        # Tests run the real programs: build them first.
+        set(programs ${ORVEX_PROGRAMS})
+        list(REMOVE_ITEM programs "")
+        if(programs)
+          add_dependencies(${part}_tests ${programs})
+        endif()
         target_include_directories(${part}_tests PRIVATE
           ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR}/tests)
         target_compile_definitions(${part}_tests PRIVATE

@@ -1,5 +1,6 @@
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -52,7 +53,14 @@ LockFile::~LockFile() { Release(); }
 bool LockFile::TryLockOnce(int operation) {
   ORVEX_CHECK(0 > (fd_ = open(path_.c_str(), O_RDWR | O_CREAT, 0644)), kErrorLockFile,
               "open failed, reason=" + std::string(std::strerror(errno)));
-  if (::flock(fd_, operation) == 0) return true;
+  if (::flock(fd_, operation) == 0) {
+    if (StillNamedByPath()) return true;
+    // The file was renamed or removed between open and flock (a queue being
+    // rotated into its snapshot): the lock guards a file nobody else will
+    // lock through this path. Try again on the file the path names now.
+    Release();
+    return false;
+  }
   const int error = errno;
   ::close(fd_);
   fd_ = -1;
@@ -60,6 +68,13 @@ bool LockFile::TryLockOnce(int operation) {
   // away by waiting.
   if (error != EINTR && error != EAGAIN) throw Error(kErrorLockFile, std::strerror(error));
   return false;
+}
+
+bool LockFile::StillNamedByPath() const {
+  struct stat locked;
+  struct stat named;
+  return ::fstat(fd_, &locked) == 0 && ::stat(path_.c_str(), &named) == 0 &&
+         locked.st_dev == named.st_dev && locked.st_ino == named.st_ino;
 }
 
 void LockFile::Release() {

@@ -53,8 +53,10 @@ class ORVEX_EXPORT LockFile {
   // Opens path (created with mode 0644 if missing; used as given, so callers
   // apply RootPath to fixed lock paths) and takes an exclusive or shared lock
   // without blocking. While another holder conflicts, it closes the file,
-  // sleeps 0 to 0.9 s at random and tries again, 64 attempts in all. Returns
-  // only with the lock held. Throws Error 506: "Exceed max retry" after the
+  // sleeps 0 to 0.9 s at random and tries again, 64 attempts in all. A lock
+  // won on a file that was renamed away meanwhile (a queue rotated into its
+  // snapshot) counts as a failed attempt: the lock held is always on the file
+  // the path names. Returns only with the lock held. Throws Error 506: "Exceed max retry" after the
   // 64th failed attempt; "open failed, reason=<text>" (logged) when the file
   // cannot be opened; the system error text when flock fails otherwise.
   LockFile(const std::string& path, bool exclusive);
@@ -69,6 +71,8 @@ class ORVEX_EXPORT LockFile {
 
  private:
   bool TryLockOnce(int operation);
+  // True while the open file is still the one the path names.
+  bool StillNamedByPath() const;
   void Release();
 
   int fd_;
