@@ -44,6 +44,7 @@ int RunShareCommand(const Args& args);   // share_commands.cc
 int RunStatusCommand(const Args& args);  // status_commands.cc
 int RunPauseCommand(const Args& args);   // status_commands.cc
 int RunResumeCommand(const Args& args);  // status_commands.cc
+int RunFolderCommand(const Args& args);  // folder_commands.cc
 
 // Arguments split into options ("--name") and positional words. "--" ends
 // the options; a word such as "-2" is positional, so that numbers may be

@@ -25,6 +25,7 @@ const CommandGroup kCommands[] = {
     {"status", "show whether indexing is paused and each share's status", RunStatusCommand},
     {"pause", "pause indexing for HOURS hours, or with no end", RunPauseCommand},
     {"resume", "resume indexing", RunResumeCommand},
+    {"folder", "list the indexed folders or show one", RunFolderCommand},
 };
 
 std::string Usage() {

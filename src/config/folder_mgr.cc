@@ -1,0 +1,70 @@
+// Loading and saving the folder list. The queries live in
+// folder_queries.cc, the changes in folder_mutation.cc.
+#include "orvex/config/folder_mgr.h"
+
+#include <sys/stat.h>
+#include <sys/types.h>
+
+#include <cerrno>
+
+#include "foundation/check.h"
+#include "orvex/foundation/error.h"
+#include "orvex/foundation/json.h"
+#include "orvex/foundation/util.h"
+#include "orvex/platform/sdk_credentials.h"
+#include "orvex/portable/root.h"
+
+namespace orvex {
+namespace fileindex {
+namespace {
+
+constexpr char kLogSource[] = "folder_mgr";
+
+std::string FoldersPath() { return portable::RootPath(kFileIndexFoldersCfgPath); }
+
+// A freshly installed package (or a fresh ORVEX_ROOT) may lack the etc
+// directory. Failures here are left for the write to report, and errno is
+// kept so that none leaks into an unrelated log line.
+void MakeParentDirectories(const std::string& path) {
+  const std::string parent = Dirname(path);
+  if (parent.empty() || IsDirExist(parent, /*follow_link=*/true)) return;
+  const int saved_errno = errno;
+  for (size_t slash = path.find('/', 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    ::mkdir(path.substr(0, slash).c_str(), 0755);
+  }
+  errno = saved_errno;
+}
+
+}  // namespace
+
+FolderMgr::FolderMgr() {
+  const std::string path = FoldersPath();
+  Json::Value folders(Json::arrayValue);
+  ORVEX_CHECK_AS(
+      IsFileExist(path) && !fromFile(folders, path),
+      "IsFileExist(kFileIndexFoldersCfgPath) && !folders.fromFile(kFileIndexFoldersCfgPath)",
+      kErrorLoadJson, "Cannot load json: " + path);
+  // Iterating an object would read its members as records, and any other
+  // value has nothing to iterate: neither is a folder list.
+  ORVEX_CHECK(!folders.isArray(), kErrorLoadJson, "Folder list is not a JSON array: " + path);
+  folders_.reserve(folders.size());
+  for (const Json::Value& data : folders) folders_.push_back(std::make_shared<Folder>(data));
+}
+
+FolderMgr::~FolderMgr() = default;
+
+void FolderMgr::Save() const {
+  sdk::SDKCredentials creds("root");
+  Json::Value folders(Json::arrayValue);
+  for (const FolderPtr& folder : folders_) folders.append(folder->GetData());
+  const std::string path = FoldersPath();
+  MakeParentDirectories(path);
+  ORVEX_CHECK_AS(!toFile(folders, path), "!folders.toFile(kFileIndexFoldersCfgPath)",
+                 kErrorSaveJson, path);
+  ORVEX_CHECK_AS(-1 == ::chmod(path.c_str(), 0644), "-1 == chmod(kFileIndexFoldersCfgPath, 0644)",
+                 kErrorSystem, path);
+}
+
+}  // namespace fileindex
+}  // namespace orvex
