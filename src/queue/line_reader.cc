@@ -26,7 +26,8 @@ LineReader::LineReader(const std::string& path) {
     errno = saved;
     return;
   }
-  buffer_.resize(kBufferSize);
+  buffer_.reset(new char[kBufferSize]);
+  capacity_ = kBufferSize;
 }
 
 LineReader::~LineReader() {
@@ -35,13 +36,18 @@ LineReader::~LineReader() {
 
 bool LineReader::Fill() {
   if (begin_ > 0) {  // keep the unread tail at the front
-    std::memmove(buffer_.data(), buffer_.data() + begin_, end_ - begin_);
+    std::memmove(buffer_.get(), buffer_.get() + begin_, end_ - begin_);
     end_ -= begin_;
     begin_ = 0;
   }
-  if (end_ == buffer_.size()) buffer_.resize(buffer_.size() * 2);  // a very long line
+  if (end_ == capacity_) {  // a very long line
+    std::unique_ptr<char[]> bigger(new char[2 * capacity_]);
+    std::memcpy(bigger.get(), buffer_.get(), end_);
+    buffer_ = std::move(bigger);
+    capacity_ *= 2;
+  }
   for (;;) {
-    ssize_t n = ::read(fd_, buffer_.data() + end_, buffer_.size() - end_);
+    ssize_t n = ::read(fd_, buffer_.get() + end_, capacity_ - end_);
     if (n < 0 && errno == EINTR) continue;
     if (n <= 0) {
       eof_ = true;
@@ -56,11 +62,11 @@ bool LineReader::Next(std::string& line) {
   if (fd_ < 0) return false;
   size_t scanned = 0;  // bytes after begin_ known to hold no newline
   for (;;) {
-    const char* start = buffer_.data() + begin_ + scanned;
+    const char* start = buffer_.get() + begin_ + scanned;
     const void* newline = std::memchr(start, '\n', end_ - begin_ - scanned);
     if (newline != nullptr) {
-      size_t at = static_cast<size_t>(static_cast<const char*>(newline) - buffer_.data());
-      line.assign(buffer_.data() + begin_, at - begin_);
+      size_t at = static_cast<size_t>(static_cast<const char*>(newline) - buffer_.get());
+      line.assign(buffer_.get() + begin_, at - begin_);
       begin_ = at + 1;
       return true;
     }
@@ -68,7 +74,7 @@ bool LineReader::Next(std::string& line) {
     if (eof_ || !Fill()) break;
   }
   if (begin_ == end_) return false;
-  line.assign(buffer_.data() + begin_, end_ - begin_);
+  line.assign(buffer_.get() + begin_, end_ - begin_);
   begin_ = end_;
   return true;
 }

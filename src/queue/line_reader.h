@@ -5,8 +5,9 @@
 #ifndef ORVEX_SRC_QUEUE_LINE_READER_H_
 #define ORVEX_SRC_QUEUE_LINE_READER_H_
 
+#include <cstddef>
+#include <memory>
 #include <string>
-#include <vector>
 
 namespace orvex {
 namespace fileindex {
@@ -30,7 +31,9 @@ class LineReader {
   bool Fill();
 
   int fd_ = -1;
-  std::vector<char> buffer_;
+  // Not zero-filled: only bytes read from the file are ever looked at.
+  std::unique_ptr<char[]> buffer_;
+  size_t capacity_ = 0;
   size_t begin_ = 0;  // first unread byte in buffer_
   size_t end_ = 0;    // one past the last valid byte
   bool eof_ = false;

@@ -42,13 +42,33 @@ OPNode::~OPNode() {
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
-  auto found = child_index_.find(name);
-  if (found != child_index_.end()) return found->second->shared_from_this();
+  const size_t hash = std::hash<std::string_view>()(name);
+  if (!child_index_.empty()) {
+    const size_t mask = child_index_.size() - 1;
+    for (size_t i = hash & mask; child_index_[i].node != nullptr; i = (i + 1) & mask) {
+      const ChildSlot& slot = child_index_[i];
+      if (slot.hash == hash && slot.node->name_ == name) return slot.node->shared_from_this();
+    }
+  }
   auto child = std::make_shared<OPNode>(shared_from_this(), name);
   children_.push_back(child);
-  // The key views the child's own name, which never changes.
-  child_index_.emplace(std::string_view(child->name_), child.get());
+  if (2 * children_.size() > child_index_.size()) {
+    std::vector<ChildSlot> old = std::move(child_index_);
+    child_index_.assign(old.empty() ? kChildIndexInitialSlots : 2 * old.size(),
+                        ChildSlot{0, nullptr});
+    for (const ChildSlot& slot : old) {
+      if (slot.node != nullptr) PlaceChild(slot);
+    }
+  }
+  PlaceChild(ChildSlot{hash, child.get()});
   return child;
+}
+
+void OPNode::PlaceChild(const ChildSlot& entry) {
+  const size_t mask = child_index_.size() - 1;
+  size_t i = entry.hash & mask;
+  while (child_index_[i].node != nullptr) i = (i + 1) & mask;
+  child_index_[i] = entry;
 }
 
 std::string OPNode::GetPath() const {
@@ -73,13 +93,21 @@ void OPNode::TraverseOP(const std::function<void(std::shared_ptr<OP>)>& f) {
   // Walk a copy: f may append to or remove from this list. Entries cancelled
   // by the time they are reached are skipped; a cancelled op never revives
   // during a walk, so cancelled entries need not be copied at all.
-  std::vector<std::shared_ptr<OP>> pending;
-  pending.reserve(ops_.size());
-  for (const auto& op : ops_) {
-    if (op->kind != OP_NONE) pending.push_back(op);
+  // Most nodes hold a handful of ops: their copy lives on the stack.
+  constexpr size_t kInline = 8;
+  std::shared_ptr<OP> inline_copy[kInline];
+  std::vector<std::shared_ptr<OP>> heap_copy;
+  std::shared_ptr<OP>* pending = inline_copy;
+  if (ops_.size() > kInline) {
+    heap_copy.resize(ops_.size());
+    pending = heap_copy.data();
   }
-  for (auto& op : pending) {
-    if (op->kind != OP_NONE) f(op);
+  size_t count = 0;
+  for (const auto& op : ops_) {
+    if (op->kind != OP_NONE) pending[count++] = op;
+  }
+  for (size_t i = 0; i < count; ++i) {
+    if (pending[i]->kind != OP_NONE) f(pending[i]);
   }
 }
 

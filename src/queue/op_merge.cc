@@ -5,6 +5,7 @@
 
 #include "orvex/foundation/error.h"
 #include "orvex/queue/op_tree.h"
+#include "queue/event_parser.h"
 
 namespace orvex {
 namespace fileindex {
@@ -135,33 +136,38 @@ void FollowRename(const std::shared_ptr<OPNode>& source, const std::shared_ptr<O
 
 }  // namespace
 
-void OPTree::InsertEvent(std::shared_ptr<Event> ev) {
-  std::shared_ptr<OPNode> node = GetNodeByPath(ev->path);
+void OPTree::InsertEvent(std::shared_ptr<Event> ev) { Insert(*ev); }
+
+template <typename Fields>
+void OPTree::Insert(const Fields& ev) {
+  std::shared_ptr<OPNode> node = GetNodeByPath(ev.path);
   // One op object for every bit of the event: a mask with several bits runs
   // several handlers on it, which can revive or absorb it in turn.
   auto op = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
   InFlight in_flight(in_flight_, op.get());
-  const uint32_t mask = ev->event;
+  const uint32_t mask = ev.event;
   if (mask & EVENT_CREATE) {
-    ev->is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
+    ev.is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
   }
   if (mask & EVENT_ATTR) HandleAttr(node, op);
   if (mask & EVENT_MODIFY) HandleModify(node, op);
   if (mask & EVENT_DELETE) {
     // A deleted directory is rescanned: the consumer drops what is gone.
-    ev->is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
+    ev.is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
   }
   if (mask & EVENT_RENAME) {
-    op->path = ev->path_old;
+    op->path = ev.path_old;
     HandleRename(node, op);
   }
   if (mask & EVENT_REINDEX) HandleReindex(node, op);
   if (mask & EVENT_UPDATE_CFG) {
-    op->data = ev->data;
+    op->data = ev.data;
     HandleUpdateCfg(node, op);
   }
   if (mask & EVENT_QUEUE_CRASHED) crashed_ = true;
 }
+
+template void OPTree::Insert<EventFields>(const EventFields& ev);
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
   RunSimpleHandler(node, op, OP_UPSERT, kCreateRules,

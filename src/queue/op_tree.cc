@@ -4,9 +4,12 @@
 
 #include <cerrno>
 #include <cstring>
+#include <functional>
+#include <string_view>
 
 #include "foundation/check.h"
 #include "orvex/foundation/log.h"
+#include "queue/event_parser.h"
 #include "queue/line_reader.h"
 
 namespace orvex {
@@ -14,6 +17,28 @@ namespace fileindex {
 namespace {
 
 constexpr char kLogSource[] = "optree";
+constexpr size_t kIndexInitialSlots = 1024;
+
+// Whether node's path is exactly path: compares the names up the parent
+// chain with the components of path from its end.
+bool HasPath(const OPNode* node, std::string_view path) {
+  size_t end = path.size();
+  for (; node->parent() != nullptr; node = node->parent().get()) {
+    const std::string& name = node->name();
+    if (end < name.size() + 1) return false;
+    const size_t start = end - name.size();
+    if (path[start - 1] != '/' || path.compare(start, name.size(), name) != 0) return false;
+    end = start - 1;
+  }
+  return end == 0;
+}
+
+uint64_t HashPath(std::string_view path) { return std::hash<std::string_view>()(path); }
+
+bool IsCanonical(const std::string& path) {
+  return path.size() > 1 && path.front() == '/' && path.back() != '/' &&
+         path.find("//") == std::string::npos;
+}
 
 }  // namespace
 
@@ -41,14 +66,27 @@ void OPTree::BuildTree() {
   ORVEX_CHECK_AS(!reader.ok(), "!input_stream", kErrorSystem,
                  "Failed to open queue, reason=" + std::string(strerror(errno)));
   std::string line;
-  while (!crashed_ && reader.Next(line)) ProcessLine(line);
+  EventFields scratch;
+  while (!crashed_ && reader.Next(line)) ProcessLine(line, scratch);
 }
 
-void OPTree::ProcessLine(const std::string& line) {
+void OPTree::ProcessLine(const std::string& line, EventFields& scratch) {
   ++lines_read_;
   if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.c_str());
   try {
-    InsertEvent(std::make_shared<Event>(line));
+    // What Event's constructor does, without a heap object per line: the
+    // common shape is scanned into the reused fields, anything else parsed
+    // afresh by the JSON parser.
+    scratch.is_dir = false;
+    scratch.path_old.clear();
+    scratch.data = Json::Value();
+    if (ParseEventFast(line, scratch)) {
+      Insert(scratch);
+    } else {
+      EventFields parsed;
+      ParseEventJson(line, parsed);
+      Insert(parsed);
+    }
   } catch (const Error& e) {
     ++lines_skipped_;
     LogErrno("%s:%d (%d, %u) InsertEvent failed, event_raw=%s, code=%d, reason=%s", kLogSource,
@@ -58,6 +96,27 @@ void OPTree::ProcessLine(const std::string& line) {
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+  const uint64_t hash = HashPath(path);
+  if (OPNode* known = FindIndexed(path, hash)) return known->shared_from_this();
+  const size_t slash = path.rfind('/');
+  if (slash == 0 || slash == std::string::npos || !IsCanonical(path)) return WalkPath(path, hash);
+  // A new name in a directory seen before: only the last component is looked
+  // up. Otherwise the directory is indexed too, for its next new name.
+  const std::string_view dir(path.data(), slash);
+  const uint64_t dir_hash = HashPath(dir);
+  std::shared_ptr<OPNode> node;
+  if (OPNode* parent = FindIndexed(dir, dir_hash)) {
+    node = parent->GetChild(path.substr(slash + 1));
+  } else {
+    node = WalkPath(path, hash);
+    AddIndexed(dir_hash, node->parent().get());
+    return node;
+  }
+  AddIndexed(hash, node.get());
+  return node;
+}
+
+std::shared_ptr<OPNode> OPTree::WalkPath(const std::string& path, uint64_t hash) {
   // Walks the non-empty components from the root, creating nodes. The node
   // reached matches the path byte for byte only when the path is canonical:
   // absolute, with no empty component and no trailing slash.
@@ -77,7 +136,37 @@ std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
     pos = next + 1;
   }
   if (!canonical) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
+  AddIndexed(hash, node.get());
   return node;
+}
+
+OPNode* OPTree::FindIndexed(std::string_view path, uint64_t hash) const {
+  if (path_index_.empty()) return nullptr;
+  const size_t mask = path_index_.size() - 1;
+  for (size_t i = hash & mask;; i = (i + 1) & mask) {
+    const PathSlot& slot = path_index_[i];
+    if (slot.node == nullptr) return nullptr;
+    if (slot.hash == hash && HasPath(slot.node, path)) return slot.node;
+  }
+}
+
+void OPTree::AddIndexed(uint64_t hash, OPNode* node) {
+  if (2 * (path_index_used_ + 1) > path_index_.size()) {
+    std::vector<PathSlot> old = std::move(path_index_);
+    path_index_.assign(old.empty() ? kIndexInitialSlots : 2 * old.size(), PathSlot{0, nullptr});
+    const size_t mask = path_index_.size() - 1;
+    for (const PathSlot& slot : old) {
+      if (slot.node == nullptr) continue;
+      size_t i = slot.hash & mask;
+      while (path_index_[i].node != nullptr) i = (i + 1) & mask;
+      path_index_[i] = slot;
+    }
+  }
+  const size_t mask = path_index_.size() - 1;
+  size_t i = hash & mask;
+  while (path_index_[i].node != nullptr) i = (i + 1) & mask;
+  path_index_[i] = PathSlot{hash, node};
+  ++path_index_used_;
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,

@@ -14,7 +14,6 @@
 #include <ostream>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 #include <vector>
 
 #include "orvex/export.h"
@@ -88,11 +87,23 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
 
  private:
   static constexpr size_t kPruneMinimum = 16;
+  static constexpr size_t kChildIndexInitialSlots = 8;
+
+  struct ChildSlot {
+    size_t hash;   // of the child's name
+    OPNode* node;  // null: free slot
+  };
+  // Puts entry into the first free slot from its hash on.
+  void PlaceChild(const ChildSlot& entry);
 
   std::string name_;
   std::shared_ptr<OPNode> parent_;
   std::vector<std::shared_ptr<OPNode>> children_;
-  std::unordered_map<std::string_view, OPNode*> child_index_;
+  // The children by name: open addressing with linear probing over the
+  // names' hashes, a power of two in size and at most half full, empty until
+  // the first child. Flat, so that a directory with very many entries is
+  // searched and grown without chasing a pointer per entry.
+  std::vector<ChildSlot> child_index_;
   std::vector<std::shared_ptr<OP>> ops_;
   size_t live_after_prune_ = 0;
 };
