@@ -22,19 +22,6 @@ constexpr char kLogSource[] = "folder_mgr";
 
 std::string FoldersPath() { return portable::RootPath(kFileIndexFoldersCfgPath); }
 
-// A freshly installed package (or a fresh ORVEX_ROOT) may lack the etc
-// directory. Failures here are left for the write to report, and errno is
-// kept so that none leaks into an unrelated log line.
-void MakeParentDirectories(const std::string& path) {
-  const std::string parent = Dirname(path);
-  if (parent.empty() || IsDirExist(parent, /*follow_link=*/true)) return;
-  const int saved_errno = errno;
-  for (size_t slash = path.find('/', 1); slash != std::string::npos;
-       slash = path.find('/', slash + 1)) {
-    ::mkdir(path.substr(0, slash).c_str(), 0755);
-  }
-  errno = saved_errno;
-}
 
 }  // namespace
 

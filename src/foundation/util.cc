@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <cctype>
+#include <cerrno>
 
 #include "kalo/kalo_fs.h"
 
@@ -77,6 +78,17 @@ std::string GetFileExtension(const std::string& path, bool lower) {
     for (char& c : extension) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
   }
   return extension;
+}
+
+void MakeParentDirectories(const std::string& path) {
+  const std::string parent = Dirname(path);
+  if (parent.empty() || IsDirExist(parent, /*follow_link=*/true)) return;
+  const int saved_errno = errno;
+  for (size_t slash = path.find('/', 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    ::mkdir(path.substr(0, slash).c_str(), 0755);
+  }
+  errno = saved_errno;
 }
 
 namespace fileindex {

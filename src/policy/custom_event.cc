@@ -33,7 +33,6 @@ constexpr char kKeyLackOfMemory[] = "error:lack_of_memory";
 constexpr char kLinkOpen[] =
     "<a data-kalo-app=\"KALO.Orvex.Application\" data-kalo-fn=\"preference\">";
 constexpr char kLinkClose[] = "</a>";
-constexpr mode_t kQueueDirMode = 0755;
 
 int Pid() { return static_cast<int>(::getpid()); }
 unsigned Euid() { return static_cast<unsigned>(::geteuid()); }
@@ -43,17 +42,8 @@ unsigned Euid() { return static_cast<unsigned>(::geteuid()); }
 // is never created here. Failures are left to the lock, which then reports
 // the open that fails.
 void MakeQueueDir(const std::string& share_root, const std::string& queue_path) {
-  const std::string dir = Dirname(queue_path);
-  if (!IsDirExist(share_root, /*follow_link=*/true)) return;
-  if (dir.size() <= share_root.size() || dir.compare(0, share_root.size(), share_root) != 0) {
-    return;
-  }
-  for (size_t slash = dir.find('/', share_root.size() + 1);; slash = dir.find('/', slash + 1)) {
-    const std::string prefix = dir.substr(0, slash);
-    if (!IsDirExist(prefix, /*follow_link=*/true)) ::mkdir(prefix.c_str(), kQueueDirMode);
-    if (slash == std::string::npos) break;
-  }
-  errno = 0;  // a directory made by someone else meanwhile is not a failure
+  // Only below a share that exists: never make up a share root.
+  if (IsDirExist(share_root, /*follow_link=*/true)) MakeParentDirectories(queue_path);
 }
 
 // One compact line: the daemon's format without "is_dir", which only the

@@ -33,19 +33,6 @@ const Json::Value* FindMember(const Json::Value& object, const char* key) {
   return object.find(key, key + std::strlen(key));
 }
 
-// A fresh root (or a freshly installed package) may not have the package's
-// etc directory yet. Failures are left for the write to report, and errno is
-// kept so that they never leak into an unrelated log line.
-void MakeParentDirectories(const std::string& path) {
-  const std::string parent = Dirname(path);
-  if (parent.empty() || IsDirExist(parent, /*follow_link=*/true)) return;
-  const int saved_errno = errno;
-  for (size_t slash = path.find('/', 1); slash != std::string::npos;
-       slash = path.find('/', slash + 1)) {
-    ::mkdir(path.substr(0, slash).c_str(), 0755);
-  }
-  errno = saved_errno;
-}
 
 // Every change holds the status lock exclusively, as the folder
 // configuration's writers hold theirs. Under a fresh ORVEX_ROOT its "tmp"

@@ -51,6 +51,11 @@ ORVEX_EXPORT std::string Dirname(const std::string& path);
 // With lower, each byte is passed through tolower.
 ORVEX_EXPORT std::string GetFileExtension(const std::string& path, bool lower);
 
+// Creates the missing directories above path (mode 0755), so that a state
+// file can be written on a fresh system or a fresh ORVEX_ROOT. Failures are
+// left for the write that follows to report; errno is left as it was.
+ORVEX_EXPORT void MakeParentDirectories(const std::string& path);
+
 namespace fileindex {
 
 // The same four string helpers, exported a second time under the file-index
