@@ -31,6 +31,7 @@
 #include "orvex/foundation/log.h"
 #include "orvex/queue/op_tree.h"
 #include "queue/line_reader.h"
+#include "bench_timing.h"
 #include "queue_generator.h"
 
 namespace {
@@ -38,7 +39,9 @@ namespace {
 using orvex::fileindex::Event;
 using orvex::fileindex::LineReader;
 using orvex::fileindex::OPTree;
-using Clock = std::chrono::steady_clock;
+using orvex::bench::Clock;
+using orvex::bench::Fastest;
+using orvex::bench::Seconds;
 
 constexpr size_t kDefaultLines = 1000000;
 constexpr size_t kFiles = 100000;
@@ -46,7 +49,6 @@ constexpr size_t kDirs = 5000;
 constexpr double kMalformed = 0.01;
 constexpr double kDirEvents = 0.01;
 constexpr size_t kDoublingBase = 100000;
-constexpr int kRepeats = 3;          // timings keep the fastest run
 constexpr int kDoublingRepeats = 5;  // the scaling runs are short: more of them
 
 constexpr double kBuildParseTarget = 1.5;
@@ -110,16 +112,6 @@ class TempDir {
   std::string path_;
   std::vector<std::string> files_;
 };
-
-double Seconds(Clock::time_point start) {
-  return std::chrono::duration<double>(Clock::now() - start).count();
-}
-
-double Fastest(const std::function<double()>& run) {
-  double best = run();
-  for (int i = 1; i < kRepeats; ++i) best = std::min(best, run());
-  return best;
-}
 
 // Peak resident memory of this process in bytes, from /proc/self/status.
 long long PeakResidentBytes() {

@@ -24,16 +24,18 @@
 #include "orvex/foundation/log.h"
 #include "orvex/queue/queue_mgr.h"
 #include "queue/line_reader.h"
+#include "bench_timing.h"
 #include "queue_generator.h"
 
 namespace {
 
 using orvex::fileindex::LineReader;
 using orvex::fileindex::QueueMgr;
-using Clock = std::chrono::steady_clock;
+using orvex::bench::Clock;
+using orvex::bench::Fastest;
+using orvex::bench::Seconds;
 
 constexpr size_t kDefaultLines = 1000000;
-constexpr int kRepeats = 3;  // timings keep the fastest run
 constexpr double kScanParseTarget = 1.2;
 
 const std::string kShare = "/volume1/photo";
@@ -66,16 +68,6 @@ class BenchDir {
  private:
   std::string path_;
 };
-
-double Seconds(Clock::time_point start) {
-  return std::chrono::duration<double>(Clock::now() - start).count();
-}
-
-double Fastest(const std::function<double()>& run) {
-  double best = run();
-  for (int i = 1; i < kRepeats; ++i) best = std::min(best, run());
-  return best;
-}
 
 bool Report(const char* what, double value, double target) {
   const bool pass = value <= target;
