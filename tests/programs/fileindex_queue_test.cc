@@ -14,30 +14,15 @@
 
 #include "../../bench/queue_generator.h"
 #include "orvex/foundation/json.h"
+#include "support/run_program.h"
 
 namespace {
 
+using orvex::testing::RunProgram;
+using Result = orvex::testing::ProgramOutcome;
+using orvex::testing::SplitLines;
+
 const std::string kProgram = std::string(ORVEX_BUILD_DIR) + "/fileindex-queue";
-
-struct Result {
-  int status = -1;  // exit status, -1 when the program did not exit normally
-  std::string out;
-  std::string err;
-};
-
-std::string ReadFile(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::ostringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
-
-std::vector<std::string> Lines(const std::string& text) {
-  std::vector<std::string> lines;
-  std::istringstream in(text);
-  for (std::string line; std::getline(in, line);) lines.push_back(line);
-  return lines;
-}
 
 // "[0k] /volume1/photo/..." with k a kind handed out for a share path (1-6).
 bool IsShareOpLine(const std::string& line) {
@@ -76,26 +61,9 @@ class FileindexQueueTest : public ::testing::Test {
 
   // Runs the program with args, stdout and stderr captured in files.
   Result Run(const std::vector<std::string>& args) {
-    const std::string out_path = Path("stdout");
-    const std::string err_path = Path("stderr");
-    pid_t pid = ::fork();
-    if (pid == 0) {
-      int out = ::open(out_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      int err = ::open(err_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      if (out < 0 || err < 0 || ::dup2(out, 1) < 0 || ::dup2(err, 2) < 0) ::_exit(127);
-      std::vector<char*> argv{const_cast<char*>(kProgram.c_str())};
-      for (const auto& a : args) argv.push_back(const_cast<char*>(a.c_str()));
-      argv.push_back(nullptr);
-      ::execv(kProgram.c_str(), argv.data());
-      ::_exit(127);
-    }
-    Result result;
-    int status = 0;
-    if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return result;
-    if (WIFEXITED(status)) result.status = WEXITSTATUS(status);
-    result.out = ReadFile(out_path);
-    result.err = ReadFile(err_path);
-    return result;
+    Path("stdout");
+    Path("stderr");
+    return RunProgram(kProgram, args, {}, dir_);
   }
 
   std::string dir_;
@@ -193,7 +161,7 @@ TEST_F(FileindexQueueTest, GeneratedQueueSkipsExactlyItsMalformedLines) {
 
   Result r = Run({queue});
   ASSERT_EQ(0, r.status) << r.err;
-  std::vector<std::string> lines = Lines(r.out);
+  std::vector<std::string> lines = SplitLines(r.out);
   ASSERT_GE(lines.size(), 2u);
   const std::string summary = lines.back();
   lines.pop_back();

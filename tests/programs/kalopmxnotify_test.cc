@@ -12,10 +12,13 @@
 #include <vector>
 
 #include "orvex/foundation/json.h"
+#include "support/run_program.h"
 #include "support/temp_dir.h"
 
 namespace {
 
+using orvex::testing::ProgramOutcome;
+using orvex::testing::RunProgram;
 using orvex::testing::ScopedOrvexRoot;
 using orvex::testing::TempDir;
 
@@ -29,32 +32,14 @@ class KalopmxnotifyTest : public ::testing::Test {
     ASSERT_EQ(0, ::access(kProgram.c_str(), X_OK)) << kProgram << " is not built";
   }
 
-  // Runs the program with args under this test's ORVEX_ROOT; stdout and
-  // stderr go to files. Returns the exit status, -1 when it did not exit.
+  // Runs the program with args under this test's ORVEX_ROOT. Returns the
+  // exit status, -1 when it did not exit; Output() is what it printed.
   int Run(const std::vector<std::string>& args) {
-    const std::string out = dir_.Join("stdout");
-    const pid_t pid = ::fork();
-    if (pid == 0) {
-      const int fd = ::open(out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      ::dup2(fd, 1);
-      ::dup2(fd, 2);
-      std::vector<char*> argv{const_cast<char*>(kProgram.c_str())};
-      for (const auto& arg : args) argv.push_back(const_cast<char*>(arg.c_str()));
-      argv.push_back(nullptr);
-      ::execv(kProgram.c_str(), argv.data());
-      ::_exit(127);
-    }
-    int status = 0;
-    if (::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
-    return WEXITSTATUS(status);
+    last_ = RunProgram(kProgram, args, {"ORVEX_ROOT=" + dir_.path()}, dir_.path());
+    return last_.status;
   }
 
-  std::string Output() const {
-    std::ifstream in(dir_.Join("stdout"));
-    std::ostringstream text;
-    text << in.rdbuf();
-    return text.str();
-  }
+  std::string Output() const { return last_.out + last_.err; }
 
   std::string NotificationsPath() const { return dir_.Join("var/lib/orvex/notifications.jsonl"); }
 
@@ -77,6 +62,7 @@ class KalopmxnotifyTest : public ::testing::Test {
 
   TempDir dir_;
   ScopedOrvexRoot root_{dir_.path()};
+  ProgramOutcome last_;
 };
 
 TEST_F(KalopmxnotifyTest, RecordsFlagsKeysAndLinkAsOneJsonLine) {

@@ -17,36 +17,19 @@
 
 #include "orvex/foundation/json.h"
 #include "status/fileindexd_peer.h"
+#include "support/run_program.h"
 #include "support/temp_dir.h"
-
-extern char** environ;
 
 namespace {
 
 using orvex::testing::FileindexdPeer;
+using orvex::testing::ReadFileText;
+using orvex::testing::RunProgram;
+using orvex::testing::SplitLines;
 using orvex::testing::TempDir;
+using Outcome = orvex::testing::ProgramOutcome;
 
 const std::string kOrvex = std::string(ORVEX_BUILD_DIR) + "/orvex";
-
-struct Outcome {
-  int status = -1;  // exit status, -1 when the program did not exit normally
-  std::string out;
-  std::string err;
-};
-
-std::string Slurp(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::ostringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
-
-std::vector<std::string> SplitLines(const std::string& text) {
-  std::vector<std::string> lines;
-  std::istringstream in(text);
-  for (std::string line; std::getline(in, line);) lines.push_back(line);
-  return lines;
-}
 
 Json::Value ParseJson(const std::string& text) {
   Json::Value value;
@@ -62,42 +45,9 @@ class OrvexCliTest : public ::testing::Test {
     ASSERT_EQ(0, ::mkdir(root_.Join("srv/photo").c_str(), 0755));
   }
 
-  // Runs orvex with args under this test's root, in UTC. The environment and
-  // argv are built before fork: the test may run a peer thread.
+  // Runs orvex with args under this test's root, in UTC.
   Outcome Run(const std::vector<std::string>& args) {
-    const std::string out_path = io_.Join("stdout");
-    const std::string err_path = io_.Join("stderr");
-    std::vector<std::string> env_text{"ORVEX_ROOT=" + root_.path(), "TZ=UTC"};
-    for (char** e = environ; *e != nullptr; ++e) {
-      const std::string entry = *e;
-      if (entry.rfind("ORVEX_ROOT=", 0) != 0 && entry.rfind("TZ=", 0) != 0) {
-        env_text.push_back(entry);
-      }
-    }
-    std::vector<char*> env;
-    for (auto& e : env_text) env.push_back(&e[0]);
-    env.push_back(nullptr);
-    std::vector<std::string> argv_text{kOrvex};
-    argv_text.insert(argv_text.end(), args.begin(), args.end());
-    std::vector<char*> argv;
-    for (auto& a : argv_text) argv.push_back(&a[0]);
-    argv.push_back(nullptr);
-
-    const pid_t pid = ::fork();
-    if (pid == 0) {
-      const int out = ::open(out_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      const int err = ::open(err_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      if (out < 0 || err < 0 || ::dup2(out, 1) < 0 || ::dup2(err, 2) < 0) ::_exit(127);
-      ::execve(kOrvex.c_str(), argv.data(), env.data());
-      ::_exit(127);
-    }
-    Outcome outcome;
-    int status = 0;
-    if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return outcome;
-    if (WIFEXITED(status)) outcome.status = WEXITSTATUS(status);
-    outcome.out = Slurp(out_path);
-    outcome.err = Slurp(err_path);
-    return outcome;
+    return RunProgram(kOrvex, args, {"ORVEX_ROOT=" + root_.path(), "TZ=UTC"}, io_.path());
   }
 
   std::string StatusPath() const { return root_.Join("var/packages/Orvex/etc/fileindex.status"); }
@@ -107,7 +57,7 @@ class OrvexCliTest : public ::testing::Test {
     root_.Write("var/packages/Orvex/etc/fileindex.status", text);
   }
 
-  Json::Value ReadStatus() const { return ParseJson(Slurp(StatusPath())); }
+  Json::Value ReadStatus() const { return ParseJson(ReadFileText(StatusPath())); }
 
   std::string SocketPath() {
     EXPECT_EQ(0, std::system(("mkdir -p '" + root_.Join("var/run") + "'").c_str()));

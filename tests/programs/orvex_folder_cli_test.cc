@@ -13,26 +13,17 @@
 #include <vector>
 
 #include "orvex/foundation/json.h"
+#include "support/run_program.h"
 #include "support/temp_dir.h"
 
 namespace {
 
+using orvex::testing::ReadFileText;
+using orvex::testing::RunProgram;
 using orvex::testing::TempDir;
+using Outcome = orvex::testing::ProgramOutcome;
 
 const std::string kOrvex = std::string(ORVEX_BUILD_DIR) + "/orvex";
-
-struct Outcome {
-  int status = -1;
-  std::string out;
-  std::string err;
-};
-
-std::string Slurp(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::ostringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
 
 class OrvexFolderCliTest : public ::testing::Test {
  protected:
@@ -57,29 +48,8 @@ class OrvexFolderCliTest : public ::testing::Test {
                 R"({"event": 64, "is_dir": false, "path": ")" + share_root_ + "/2024/a.jpg\"}\n");
   }
 
-  Outcome Run(std::vector<std::string> args) {
-    args.insert(args.begin(), kOrvex);
-    std::vector<char*> argv;
-    for (auto& a : args) argv.push_back(&a[0]);
-    argv.push_back(nullptr);
-    const std::string out_path = io_.Join("out");
-    const std::string err_path = io_.Join("err");
-    const pid_t pid = ::fork();
-    if (pid == 0) {
-      ::setenv("ORVEX_ROOT", root_.path().c_str(), 1);
-      const int out = ::open(out_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      const int err = ::open(err_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-      if (out < 0 || err < 0 || ::dup2(out, 1) < 0 || ::dup2(err, 2) < 0) ::_exit(127);
-      ::execv(kOrvex.c_str(), argv.data());
-      ::_exit(127);
-    }
-    Outcome outcome;
-    int status = 0;
-    if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return outcome;
-    if (WIFEXITED(status)) outcome.status = WEXITSTATUS(status);
-    outcome.out = Slurp(out_path);
-    outcome.err = Slurp(err_path);
-    return outcome;
+  Outcome Run(const std::vector<std::string>& args) {
+    return RunProgram(kOrvex, args, {"ORVEX_ROOT=" + root_.path()}, io_.path());
   }
 
   Json::Value RunJson(const std::vector<std::string>& args) {
