@@ -57,10 +57,31 @@ bool Exists(const std::string& path) {
 
 // A queue directory with its live queue and snapshot, under a private
 // ORVEX_ROOT (IsFullPathProcessing loads the folder configuration from it).
+struct ScanCase {
+  std::vector<std::string> live;
+  std::vector<std::string> tmp;
+  std::string full_path;
+  bool expected;
+};
+
 class QueueMgrTest : public ::testing::Test {
  protected:
   void WriteLive(const std::vector<std::string>& lines) { Write(live_, lines); }
   void WriteTmp(const std::vector<std::string>& lines) { Write(tmp_, lines); }
+
+  // Writes each case's live queue and snapshot and checks query's answer.
+  void ExpectScans(const std::vector<ScanCase>& cases,
+                   bool (QueueMgr::*query)(const std::string&)) {
+    for (size_t i = 0; i < cases.size(); ++i) {
+      const ScanCase& c = cases[i];
+      std::filesystem::remove(live_);
+      std::filesystem::remove(tmp_);
+      if (!c.live.empty()) WriteLive(c.live);
+      if (!c.tmp.empty()) WriteTmp(c.tmp);
+      QueueMgr queue(live_);
+      EXPECT_EQ(c.expected, (queue.*query)(c.full_path)) << "case " << i << ": " << c.full_path;
+    }
+  }
 
   static void Write(const std::string& path, const std::vector<std::string>& lines) {
     std::ofstream out(path, std::ios::binary | std::ios::trunc);
@@ -171,13 +192,6 @@ TEST_F(QueueMgrTest, RenameFailureThrows502AndLeavesTheQueue) {
   EXPECT_TRUE(Exists(live));
 }
 
-struct ScanCase {
-  std::vector<std::string> live;
-  std::vector<std::string> tmp;
-  std::string full_path;
-  bool expected;
-};
-
 TEST_F(QueueMgrTest, IsFullPathProcessingMatchesWholeComponentsInBothFiles) {
   const std::vector<ScanCase> cases = {
       {{Line(EVENT_MODIFY, "/v/s/a/b")}, {}, "/v/s/a", true},
@@ -189,15 +203,7 @@ TEST_F(QueueMgrTest, IsFullPathProcessingMatchesWholeComponentsInBothFiles) {
       {{Line(EVENT_MODIFY, "/v/t/a")}, {Line(EVENT_CREATE, "/v/s/a/deep/f")}, "/v/s/a", true},
       {{}, {Line(EVENT_MODIFY, "/v/s/ab/f")}, "/v/s/a", false},
   };
-  for (size_t i = 0; i < cases.size(); ++i) {
-    const ScanCase& c = cases[i];
-    std::filesystem::remove(live_);
-    std::filesystem::remove(tmp_);
-    if (!c.live.empty()) WriteLive(c.live);
-    if (!c.tmp.empty()) WriteTmp(c.tmp);
-    EXPECT_EQ(c.expected, QueueMgr(live_).IsFullPathProcessing(c.full_path))
-        << "case " << i << ": " << c.full_path;
-  }
+  ExpectScans(cases, &QueueMgr::IsFullPathProcessing);
 }
 
 TEST_F(QueueMgrTest, IsFullPathHasReindexNeedsAPureReindexOfThePathOrAnAncestor) {
@@ -210,15 +216,7 @@ TEST_F(QueueMgrTest, IsFullPathHasReindexNeedsAPureReindexOfThePathOrAnAncestor)
       {{Line(EVENT_UPDATE_CFG, "/v/s/a")}, {}, "/v/s/a/b", false},
       {{Line(EVENT_CREATE, "/v/s")}, {Line(EVENT_REINDEX, "/v/s")}, "/v/s/a/b", true},
   };
-  for (size_t i = 0; i < cases.size(); ++i) {
-    const ScanCase& c = cases[i];
-    std::filesystem::remove(live_);
-    std::filesystem::remove(tmp_);
-    if (!c.live.empty()) WriteLive(c.live);
-    if (!c.tmp.empty()) WriteTmp(c.tmp);
-    EXPECT_EQ(c.expected, QueueMgr(live_).IsFullPathHasReindex(c.full_path))
-        << "case " << i << ": " << c.full_path;
-  }
+  ExpectScans(cases, &QueueMgr::IsFullPathHasReindex);
 }
 
 // On every kind of line, both queries answer as a naive reading through
