@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "orvex/foundation/json.h"
+#include "queue/node_index.h"
 
 namespace orvex {
 namespace fileindex {
@@ -28,7 +29,15 @@ void OP::MergeData(const Json::Value& other) {
 }
 
 OPNode::OPNode(std::shared_ptr<OPNode> parent, const std::string& name)
-    : name_(name), parent_(std::move(parent)) {}
+    : name_(name),
+      parent_(std::move(parent)),
+      key_(NodeIndex::kRootKey),
+      owned_index_(std::make_unique<NodeIndex>()) {
+  index_ = owned_index_.get();
+}
+
+OPNode::OPNode(Passkey, std::shared_ptr<OPNode> parent, const std::string& name, uint64_t key)
+    : name_(name), parent_(std::move(parent)), key_(key), index_(parent_->index_) {}
 
 OPNode::~OPNode() {
   // Release the chain of parents iteratively: a node held only by its child
@@ -42,33 +51,27 @@ OPNode::~OPNode() {
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
-  const size_t hash = std::hash<std::string_view>()(name);
-  if (!child_index_.empty()) {
-    const size_t mask = child_index_.size() - 1;
-    for (size_t i = hash & mask; child_index_[i].node != nullptr; i = (i + 1) & mask) {
-      const ChildSlot& slot = child_index_[i];
-      if (slot.hash == hash && slot.node->name_ == name) return slot.node->shared_from_this();
+  if (index_->retired()) {
+    // The tree is gone and its index with it: what is left is a detached
+    // fragment, searched the plain way.
+    for (const auto& child : children_) {
+      if (child->name_ == name) return child;
     }
+    children_.push_back(std::make_shared<OPNode>(Passkey(), shared_from_this(), name, 0));
+    return children_.back();
   }
-  auto child = std::make_shared<OPNode>(shared_from_this(), name);
-  children_.push_back(child);
-  if (2 * children_.size() > child_index_.size()) {
-    std::vector<ChildSlot> old = std::move(child_index_);
-    child_index_.assign(old.empty() ? kChildIndexInitialSlots : 2 * old.size(),
-                        ChildSlot{0, nullptr});
-    for (const ChildSlot& slot : old) {
-      if (slot.node != nullptr) PlaceChild(slot);
-    }
-  }
-  PlaceChild(ChildSlot{hash, child.get()});
-  return child;
+  const uint64_t key = NodeIndex::ChildKey(key_, name);
+  OPNode* child = index_->FindChild(key, this, name);
+  if (child == nullptr) child = AddChild(name, key);
+  return child->shared_from_this();
 }
 
-void OPNode::PlaceChild(const ChildSlot& entry) {
-  const size_t mask = child_index_.size() - 1;
-  size_t i = entry.hash & mask;
-  while (child_index_[i].node != nullptr) i = (i + 1) & mask;
-  child_index_[i] = entry;
+OPNode* OPNode::AddChild(std::string_view name, uint64_t key) {
+  children_.push_back(
+      std::make_shared<OPNode>(Passkey(), shared_from_this(), std::string(name), key));
+  OPNode* child = children_.back().get();
+  index_->Add(key, child);
+  return child;
 }
 
 std::string OPNode::GetPath() const {
@@ -128,6 +131,19 @@ void OPNode::AttachOP(std::shared_ptr<OP> op, const OP* keep) {
 
 void OPNode::DetachOPs(const std::vector<std::shared_ptr<OP>>& moved) {
   if (moved.empty()) return;
+  // A node moves a handful of ops at a time: compare them directly.
+  constexpr size_t kDirectMaximum = 8;
+  if (moved.size() <= kDirectMaximum) {
+    ops_.erase(std::remove_if(ops_.begin(), ops_.end(),
+                              [&moved](const std::shared_ptr<OP>& e) {
+                                for (const auto& gone : moved) {
+                                  if (gone == e) return true;
+                                }
+                                return false;
+                              }),
+               ops_.end());
+    return;
+  }
   std::unordered_set<const OP*> gone;
   for (const auto& op : moved) gone.insert(op.get());
   ops_.erase(std::remove_if(ops_.begin(), ops_.end(),
@@ -137,7 +153,6 @@ void OPNode::DetachOPs(const std::vector<std::shared_ptr<OP>>& moved) {
 
 void OPNode::ReleaseLinks() {
   children_.clear();
-  child_index_.clear();
   ops_.clear();
 }
 

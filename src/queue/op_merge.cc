@@ -6,6 +6,7 @@
 #include "orvex/foundation/error.h"
 #include "orvex/queue/op_tree.h"
 #include "queue/event_parser.h"
+#include "queue/node_index.h"
 
 namespace orvex {
 namespace fileindex {
@@ -68,14 +69,38 @@ void ApplyRule(const Rule& rule, OP& incoming, OP& pending) {
 
 bool IsMergeable(FileIndexOP kind) { return kind >= OP_DELETE && kind <= OP_REINDEX; }
 
+// Calls f(e) for each pending op e of node, in list order. Only for folds
+// that change kinds and data: the list itself must not change meanwhile,
+// which is what lets the walk skip TraverseOP's copy of it.
+template <typename Fn>
+void ForEachPending(OPNode& node, Fn f) {
+  for (const auto& e : node.ops()) {
+    if (e->kind != OP_NONE) f(*e);
+  }
+}
+
+// Calls f on every node below node, in no particular order; f must not
+// create nodes.
+template <typename Fn>
+void ForEachDescendant(OPNode& node, Fn f) {
+  std::vector<OPNode*> stack;
+  for (const auto& child : node.children()) stack.push_back(child.get());
+  while (!stack.empty()) {
+    OPNode* descendant = stack.back();
+    stack.pop_back();
+    for (const auto& child : descendant->children()) stack.push_back(child.get());
+    f(*descendant);
+  }
+}
+
 // Sets the new op's kind, folds it against every pending op of the node by
 // the row's rules, and appends it unless it was absorbed.
 template <typename AppendFn>
-void RunSimpleHandler(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op,
-                      FileIndexOP kind, const RuleRow& rules, AppendFn append) {
+void FoldSimple(OPNode& node, const std::shared_ptr<OP>& op, FileIndexOP kind,
+                const RuleRow& rules, AppendFn append) {
   op->kind = kind;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
-    if (IsMergeable(e->kind)) ApplyRule(rules[e->kind - OP_DELETE], *op, *e);
+  ForEachPending(node, [&](OP& e) {
+    if (IsMergeable(e.kind)) ApplyRule(rules[e.kind - OP_DELETE], *op, e);
   });
   if (op->kind != OP_NONE) append(node, op);
 }
@@ -92,77 +117,36 @@ class InFlight {
   const OP*& slot_;
 };
 
-// Visits every descendant d of `source` in the order of
-// OPTree::TraverseNodeDescendant (post-order, children copied on entry) and
-// calls f(d, d') where d' is the node of d's path with the source's path
-// replaced by the target's. d' is found, and created if missing, at the
-// moment d is visited, top-down from the target, exactly as a lookup of the
-// rewritten path from the root would; but each counterpart is found once and
-// remembered, so a deep subtree costs time linear in its size rather than
-// one walk from the root per node.
-template <typename Fn>
-void FollowRename(const std::shared_ptr<OPNode>& source, const std::shared_ptr<OPNode>& target,
-                  Fn f) {
-  struct Frame {
-    std::shared_ptr<OPNode> node;
-    std::vector<std::shared_ptr<OPNode>> children;
-    size_t next;
-    std::shared_ptr<OPNode> counterpart;  // empty until first needed
-  };
-  std::vector<Frame> stack;
-  stack.push_back(Frame{source, source->children(), 0, target});
-  auto counterpart_of = [&stack](size_t index) {
-    size_t known = index;
-    while (!stack[known].counterpart) --known;  // the bottom frame always has one
-    for (size_t i = known + 1; i <= index; ++i) {
-      stack[i].counterpart = stack[i - 1].counterpart->GetChild(stack[i].node->name());
-    }
-    return stack[index].counterpart;
-  };
-  while (stack.size() > 1 || stack.back().next < stack.back().children.size()) {
-    Frame& top = stack.back();
-    if (top.next < top.children.size()) {
-      std::shared_ptr<OPNode> child = top.children[top.next++];
-      std::vector<std::shared_ptr<OPNode>> grandchildren = child->children();
-      stack.push_back(Frame{std::move(child), std::move(grandchildren), 0, nullptr});
-      continue;
-    }
-    std::shared_ptr<OPNode> to = counterpart_of(stack.size() - 1);
-    std::shared_ptr<OPNode> from = std::move(top.node);
-    stack.pop_back();
-    f(from, to);
-  }
-}
-
 }  // namespace
 
 void OPTree::InsertEvent(std::shared_ptr<Event> ev) { Insert(*ev); }
 
 template <typename Fields>
 void OPTree::Insert(const Fields& ev) {
-  std::shared_ptr<OPNode> node = GetNodeByPath(ev.path);
+  OPNode& node = *NodeOf(ev.path);
   // One op object for every bit of the event: a mask with several bits runs
   // several handlers on it, which can revive or absorb it in turn.
-  auto op = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+  auto op = std::make_shared<OP>(node.shared_from_this(), OP_NONE, std::string(), Json::Value());
   InFlight in_flight(in_flight_, op.get());
+  auto append = [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); };
   const uint32_t mask = ev.event;
   if (mask & EVENT_CREATE) {
-    ev.is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
+    ev.is_dir ? FoldReindex(node, op) : FoldSimple(node, op, OP_UPSERT, kCreateRules, append);
   }
-  if (mask & EVENT_ATTR) HandleAttr(node, op);
-  if (mask & EVENT_MODIFY) HandleModify(node, op);
+  if (mask & EVENT_ATTR) FoldSimple(node, op, OP_ATTR, kAttrRules, append);
+  if (mask & EVENT_MODIFY) FoldSimple(node, op, OP_UPSERT, kModifyRules, append);
   if (mask & EVENT_DELETE) {
     // A deleted directory is rescanned: the consumer drops what is gone.
-    ev.is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
+    ev.is_dir ? FoldReindex(node, op) : FoldSimple(node, op, OP_DELETE, kDeleteRules, append);
   }
   if (mask & EVENT_RENAME) {
     op->path = ev.path_old;
-    HandleRename(node, op);
+    FoldRename(node, op);
   }
-  if (mask & EVENT_REINDEX) HandleReindex(node, op);
+  if (mask & EVENT_REINDEX) FoldReindex(node, op);
   if (mask & EVENT_UPDATE_CFG) {
     op->data = ev.data;
-    HandleUpdateCfg(node, op);
+    FoldSimple(node, op, OP_UPDATE_CFG, kUpdateCfgRules, append);
   }
   if (mask & EVENT_QUEUE_CRASHED) crashed_ = true;
 }
@@ -170,34 +154,42 @@ void OPTree::Insert(const Fields& ev) {
 template void OPTree::Insert<EventFields>(const EventFields& ev);
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  RunSimpleHandler(node, op, OP_UPSERT, kCreateRules,
-                   [this](const auto& n, const auto& o) { Append(n, o); });
+  FoldSimple(*node, op, OP_UPSERT, kCreateRules,
+             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
 }
 
 void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  RunSimpleHandler(node, op, OP_UPSERT, kModifyRules,
-                   [this](const auto& n, const auto& o) { Append(n, o); });
+  FoldSimple(*node, op, OP_UPSERT, kModifyRules,
+             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
 }
 
 void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  RunSimpleHandler(node, op, OP_ATTR, kAttrRules,
-                   [this](const auto& n, const auto& o) { Append(n, o); });
+  FoldSimple(*node, op, OP_ATTR, kAttrRules,
+             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
 }
 
 void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  RunSimpleHandler(node, op, OP_DELETE, kDeleteRules,
-                   [this](const auto& n, const auto& o) { Append(n, o); });
+  FoldSimple(*node, op, OP_DELETE, kDeleteRules,
+             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
 }
 
 void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  RunSimpleHandler(node, op, OP_UPDATE_CFG, kUpdateCfgRules,
-                   [this](const auto& n, const auto& o) { Append(n, o); });
+  FoldSimple(*node, op, OP_UPDATE_CFG, kUpdateCfgRules,
+             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
 }
 
 void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  FoldReindex(*node, op);
+}
+
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  FoldRename(*node, op);
+}
+
+void OPTree::FoldReindex(OPNode& node, const std::shared_ptr<OP>& op) {
   op->kind = OP_REINDEX;
-  node->TraverseOP([&op](std::shared_ptr<OP> e) {
-    switch (e->kind) {
+  ForEachPending(node, [&op](OP& e) {
+    switch (e.kind) {
       case OP_DELETE:
       case OP_REINDEX:
         op->kind = OP_NONE;
@@ -205,7 +197,7 @@ void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op)
       case OP_UPSERT:
       case OP_ATTR:
       case OP_UPDATE_CFG:
-        e->kind = OP_REINDEX;  // its data stays as it was
+        e.kind = OP_REINDEX;  // its data stays as it was
         op->kind = OP_NONE;
         break;
       default:
@@ -215,18 +207,16 @@ void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op)
   // Everything pending below is covered by the reindex, except renames,
   // which the index still has to carry out. Runs even when the new op was
   // absorbed above.
-  TraverseNodeDescendant(
-      node,
-      [](std::shared_ptr<OPNode> descendant) {
-        descendant->TraverseOP([](std::shared_ptr<OP> e) {
-          if (e->kind != OP_RENAME) e->kind = OP_NONE;
-        });
-      },
-      /*skip_self=*/true);
+  ForEachDescendant(node, [](OPNode& descendant) {
+    ForEachPending(descendant, [](OP& e) {
+      if (e.kind != OP_RENAME) e.kind = OP_NONE;
+    });
+  });
   if (op->kind != OP_NONE) Append(node, op);
 }
 
-void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::FoldRename(OPNode& node_ref, const std::shared_ptr<OP>& op) {
+  const std::shared_ptr<OPNode> node = node_ref.shared_from_this();
   const std::string old_path = op->path;
   const std::string new_path = node->GetPath();
   // No file system can move a directory into itself. Following such a line
@@ -237,7 +227,7 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
       new_path.compare(0, old_path.size(), old_path) == 0 && new_path[old_path.size()] == '/') {
     throw Error(kErrorBadArgument, "Rename into its own subtree: " + old_path + " -> " + new_path);
   }
-  std::shared_ptr<OPNode> old_node = GetNodeByPath(old_path);
+  OPNode& old_node = *NodeOf(old_path);
   // Carries what the source still needed (an upsert, attribute refresh or
   // reindex) to the new path, after the rename itself.
   auto extra = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
@@ -249,7 +239,7 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   });
 
   std::vector<std::shared_ptr<OP>> moved;
-  old_node->TraverseOP([&](std::shared_ptr<OP> e) {
+  old_node.TraverseOP([&](std::shared_ptr<OP> e) {
     if (e->kind == OP_UPSERT || e->kind == OP_ATTR || e->kind == OP_REINDEX) {
       extra->kind = e->kind;  // the last such op wins
       e->kind = OP_NONE;
@@ -258,19 +248,67 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   });
   MoveOPs(old_node, node, moved);
 
-  // Pending work below the source follows it to the new path, keeping its
-  // place in the processing order; deletes stay where the files were.
-  FollowRename(old_node, node, [this](const std::shared_ptr<OPNode>& from,
-                                      const std::shared_ptr<OPNode>& to) {
-    std::vector<std::shared_ptr<OP>> following;
-    from->TraverseOP([&following](std::shared_ptr<OP> e) {
-      if (e->kind != OP_DELETE) following.push_back(std::move(e));
-    });
-    MoveOPs(from, to, following);
-  });
+  FollowRename(old_node, node);
 
-  Append(node, op);
-  if (extra->kind != OP_NONE) Append(node, extra);
+  Append(*node, op);
+  if (extra->kind != OP_NONE) Append(*node, extra);
+}
+
+// Pending work below the source follows it to the new path, keeping its
+// place in the processing order; deletes stay where the files were.
+// Visits every descendant d of source in the order of TraverseNodeDescendant
+// (post-order, children as they were on entry) and moves d's ops to d', the
+// node of d's path with the source's path replaced by the target's. d' is
+// found, and created if missing, at the moment d is visited, top-down from
+// the target, exactly as a lookup of the rewritten path from the root would;
+// but each counterpart is found once and remembered, so a deep subtree costs
+// time linear in its size rather than one walk from the root per node.
+void OPTree::FollowRename(OPNode& source, const std::shared_ptr<OPNode>& target) {
+  // Children are only ever appended, so a frame remembers how many its node
+  // had on entry instead of copying them.
+  struct Frame {
+    OPNode* node;
+    size_t next;
+    size_t end;
+    std::shared_ptr<OPNode> counterpart;  // empty until first needed
+  };
+  // How many siblings ahead a counterpart's index slot starts loading: the
+  // slots are scattered over the whole index, and a large subtree would
+  // otherwise wait for memory at every node.
+  constexpr size_t kPrefetchAhead = 6;
+  std::vector<Frame> stack;
+  stack.push_back(Frame{&source, 0, source.children().size(), target});
+  auto counterpart_of = [&stack](size_t index) -> const std::shared_ptr<OPNode>& {
+    size_t known = index;
+    while (!stack[known].counterpart) --known;  // the bottom frame always has one
+    for (size_t i = known + 1; i <= index; ++i) {
+      stack[i].counterpart = stack[i - 1].counterpart->GetChild(stack[i].node->name());
+    }
+    return stack[index].counterpart;
+  };
+  std::vector<std::shared_ptr<OP>> following;
+  while (stack.size() > 1 || stack.back().next < stack.back().end) {
+    Frame& top = stack.back();
+    if (top.next < top.end) {
+      const auto& children = top.node->children();
+      if (top.counterpart && top.next + kPrefetchAhead < top.end) {
+        const OPNode& parent = *top.counterpart;
+        parent.index().Prefetch(
+            NodeIndex::ChildKey(parent.key(), children[top.next + kPrefetchAhead]->name()));
+      }
+      OPNode* child = children[top.next++].get();
+      stack.push_back(Frame{child, 0, child->children().size(), nullptr});
+      continue;
+    }
+    const std::shared_ptr<OPNode> to = counterpart_of(stack.size() - 1);
+    OPNode& from = *top.node;
+    stack.pop_back();
+    following.clear();
+    for (const auto& e : from.ops()) {
+      if (e->kind != OP_NONE && e->kind != OP_DELETE) following.push_back(e);
+    }
+    MoveOPs(from, to, following);
+  }
 }
 
 }  // namespace fileindex

@@ -11,29 +11,13 @@
 #include "orvex/foundation/log.h"
 #include "queue/event_parser.h"
 #include "queue/line_reader.h"
+#include "queue/node_index.h"
 
 namespace orvex {
 namespace fileindex {
 namespace {
 
 constexpr char kLogSource[] = "optree";
-constexpr size_t kIndexInitialSlots = 1024;
-
-// Whether node's path is exactly path: compares the names up the parent
-// chain with the components of path from its end.
-bool HasPath(const OPNode* node, std::string_view path) {
-  size_t end = path.size();
-  for (; node->parent() != nullptr; node = node->parent().get()) {
-    const std::string& name = node->name();
-    if (end < name.size() + 1) return false;
-    const size_t start = end - name.size();
-    if (path[start - 1] != '/' || path.compare(start, name.size(), name) != 0) return false;
-    end = start - 1;
-  }
-  return end == 0;
-}
-
-uint64_t HashPath(std::string_view path) { return std::hash<std::string_view>()(path); }
 
 bool IsCanonical(const std::string& path) {
   return path.size() > 1 && path.front() == '/' && path.back() != '/' &&
@@ -50,7 +34,9 @@ OPTree::OPTree(const std::string& queue_path)
 OPTree::~OPTree() {
   // Nodes link to their parents and ops to their nodes with owning pointers,
   // and nodes own their children and ops: cut the downward links, then free
-  // the nodes deepest first so no destructor recurses down a long path.
+  // the nodes deepest first so no destructor recurses down a long path. The
+  // index goes first: it must not outlive the nodes it points to.
+  root_->index().Retire();
   ops_.clear();
   std::vector<std::shared_ptr<OPNode>> nodes{root_};
   for (size_t i = 0; i < nodes.size(); ++i) {
@@ -96,32 +82,38 @@ void OPTree::ProcessLine(const std::string& line, EventFields& scratch) {
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
-  const uint64_t hash = HashPath(path);
-  if (OPNode* known = FindIndexed(path, hash)) return known->shared_from_this();
-  const size_t slash = path.rfind('/');
-  if (slash == 0 || slash == std::string::npos || !IsCanonical(path)) return WalkPath(path, hash);
-  // A new name in a directory seen before: only the last component is looked
-  // up. Otherwise the directory is indexed too, for its next new name.
-  const std::string_view dir(path.data(), slash);
-  const uint64_t dir_hash = HashPath(dir);
-  std::shared_ptr<OPNode> node;
-  if (OPNode* parent = FindIndexed(dir, dir_hash)) {
-    node = parent->GetChild(path.substr(slash + 1));
-  } else {
-    node = WalkPath(path, hash);
-    AddIndexed(dir_hash, node->parent().get());
-    return node;
-  }
-  AddIndexed(hash, node.get());
-  return node;
+  return NodeOf(path)->shared_from_this();
 }
 
-std::shared_ptr<OPNode> OPTree::WalkPath(const std::string& path, uint64_t hash) {
+OPNode* OPTree::NodeOf(const std::string& path) {
+  if (!IsCanonical(path)) return WalkPath(path);
+  // The keys of the path and of its directory, from the components.
+  uint64_t dir_key = NodeIndex::kRootKey;
+  uint64_t key = NodeIndex::kRootKey;
+  size_t last = 1;
+  for (size_t pos = 1; pos <= path.size();) {
+    size_t next = path.find('/', pos);
+    if (next == std::string::npos) next = path.size();
+    dir_key = key;
+    key = NodeIndex::ChildKey(key, std::string_view(path).substr(pos, next - pos));
+    last = pos;
+    pos = next + 1;
+  }
+  NodeIndex& index = root_->index();
+  if (OPNode* known = index.FindPath(key, path)) return known;
+  // Every node of the tree is in the index, so a directory found there with
+  // the path missing is a directory without that entry yet.
+  const std::string_view dir(path.data(), last - 1);
+  OPNode* parent = dir.empty() ? root_.get() : index.FindPath(dir_key, dir);
+  if (parent == nullptr) return WalkPath(path);
+  return parent->AddChild(std::string_view(path).substr(last), key);
+}
+
+OPNode* OPTree::WalkPath(const std::string& path) {
   // Walks the non-empty components from the root, creating nodes. The node
   // reached matches the path byte for byte only when the path is canonical:
   // absolute, with no empty component and no trailing slash.
   std::shared_ptr<OPNode> node = root_;
-  bool canonical = path.size() > 1 && path.front() == '/' && path.back() != '/';
   std::string component;
   size_t pos = 0;
   while (pos < path.size()) {
@@ -130,43 +122,11 @@ std::shared_ptr<OPNode> OPTree::WalkPath(const std::string& path, uint64_t hash)
     if (next > pos) {
       component.assign(path, pos, next - pos);
       node = node->GetChild(component);
-    } else if (pos != 0) {
-      canonical = false;  // "//"
     }
     pos = next + 1;
   }
-  if (!canonical) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
-  AddIndexed(hash, node.get());
-  return node;
-}
-
-OPNode* OPTree::FindIndexed(std::string_view path, uint64_t hash) const {
-  if (path_index_.empty()) return nullptr;
-  const size_t mask = path_index_.size() - 1;
-  for (size_t i = hash & mask;; i = (i + 1) & mask) {
-    const PathSlot& slot = path_index_[i];
-    if (slot.node == nullptr) return nullptr;
-    if (slot.hash == hash && HasPath(slot.node, path)) return slot.node;
-  }
-}
-
-void OPTree::AddIndexed(uint64_t hash, OPNode* node) {
-  if (2 * (path_index_used_ + 1) > path_index_.size()) {
-    std::vector<PathSlot> old = std::move(path_index_);
-    path_index_.assign(old.empty() ? kIndexInitialSlots : 2 * old.size(), PathSlot{0, nullptr});
-    const size_t mask = path_index_.size() - 1;
-    for (const PathSlot& slot : old) {
-      if (slot.node == nullptr) continue;
-      size_t i = slot.hash & mask;
-      while (path_index_[i].node != nullptr) i = (i + 1) & mask;
-      path_index_[i] = slot;
-    }
-  }
-  const size_t mask = path_index_.size() - 1;
-  size_t i = hash & mask;
-  while (path_index_[i].node != nullptr) i = (i + 1) & mask;
-  path_index_[i] = PathSlot{hash, node};
-  ++path_index_used_;
+  if (!IsCanonical(path)) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
+  return node.get();
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
@@ -211,12 +171,12 @@ int OPTree::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& f) {
   return static_cast<int>(ops_.size());
 }
 
-void OPTree::Append(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::Append(OPNode& node, const std::shared_ptr<OP>& op) {
   ops_.push_back(op);
-  node->AttachOP(op, in_flight_);
+  node.AttachOP(op, in_flight_);
 }
 
-void OPTree::MoveOPs(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to,
+void OPTree::MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to,
                      const std::vector<std::shared_ptr<OP>>& moved) {
   for (const auto& op : moved) {
     to->AttachOP(op, in_flight_);
@@ -224,7 +184,7 @@ void OPTree::MoveOPs(const std::shared_ptr<OPNode>& from, const std::shared_ptr<
   }
   // Every occurrence leaves the source, also when source and target are the
   // same node.
-  from->DetachOPs(moved);
+  from.DetachOPs(moved);
 }
 
 }  // namespace fileindex

@@ -9,6 +9,7 @@
 
 #include <json/json.h>
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <ostream>
@@ -33,7 +34,9 @@ enum FileIndexOP : int {
   OP_QUEUE_CRASHED = 7,  // the queue is incomplete: reindex the whole share
 };
 
+class NodeIndex;
 class OPNode;
+class OPTree;
 
 struct ORVEX_EXPORT OP {
   OP(std::shared_ptr<OPNode> node, FileIndexOP kind, const std::string& path,
@@ -51,15 +54,26 @@ struct ORVEX_EXPORT OP {
 };
 
 class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
+  // Lets only GetChild construct the nodes that join an existing tree.
+  class Passkey {
+    friend class OPNode;
+    explicit Passkey() = default;
+  };
+
  public:
+  // A node that heads a tree of its own: it and the descendants it creates
+  // share one index, whatever `parent` is.
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  // Used by GetChild through std::make_shared; not callable elsewhere.
+  OPNode(Passkey, std::shared_ptr<OPNode> parent, const std::string& name, uint64_t key);
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;
   ~OPNode();
 
   // The child named `name` (exact bytes), created and appended when absent.
-  // The node must already be owned by a shared_ptr. Constant time: children
-  // are indexed by name as well as kept in creation order.
+  // The node must already be owned by a shared_ptr. Constant time: every
+  // node of a tree is indexed by its parent and name as well as kept in its
+  // parent's creation order.
   std::shared_ptr<OPNode> GetChild(const std::string& name);
 
   // "/a/b" for node b under a under the root; the root's path is empty.
@@ -82,30 +96,28 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   // Removes every occurrence of the given ops from this node's list.
   void DetachOPs(const std::vector<std::shared_ptr<OP>>& moved);
   // Drops the downward links (children and ops) so that a dropped tree
-  // releases its nodes; used only by OPTree's destructor.
+  // releases its nodes; used only by OPTree's destructor, which first
+  // retires the tree's index.
   void ReleaseLinks();
 
  private:
+  friend class OPTree;
   static constexpr size_t kPruneMinimum = 16;
-  static constexpr size_t kChildIndexInitialSlots = 8;
 
-  struct ChildSlot {
-    size_t hash;   // of the child's name
-    OPNode* node;  // null: free slot
-  };
-  // Puts entry into the first free slot from its hash on.
-  void PlaceChild(const ChildSlot& entry);
+  // Creates, records and appends the child named name, whose key is key;
+  // the caller knows there is none yet.
+  OPNode* AddChild(std::string_view name, uint64_t key);
+  NodeIndex& index() const { return *index_; }
+  uint64_t key() const { return key_; }
 
   std::string name_;
   std::shared_ptr<OPNode> parent_;
   std::vector<std::shared_ptr<OPNode>> children_;
-  // The children by name: open addressing with linear probing over the
-  // names' hashes, a power of two in size and at most half full, empty until
-  // the first child. Flat, so that a directory with very many entries is
-  // searched and grown without chasing a pointer per entry.
-  std::vector<ChildSlot> child_index_;
   std::vector<std::shared_ptr<OP>> ops_;
   size_t live_after_prune_ = 0;
+  uint64_t key_;      // this node's key in index_
+  NodeIndex* index_;  // shared with the tree this node heads or belongs to
+  std::unique_ptr<NodeIndex> owned_index_;  // set when this node heads a tree
 };
 
 // "[kk] " + (rename: old path + " -> ") + node path + (config: ", data=" + JSON),

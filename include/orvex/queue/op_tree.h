@@ -7,11 +7,9 @@
 #define ORVEX_QUEUE_OP_TREE_H_
 
 #include <cstddef>
-#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string>
-#include <string_view>
 #include <vector>
 
 #include "orvex/export.h"
@@ -79,10 +77,10 @@ class ORVEX_EXPORT OPTree {
 
  private:
   // Appends op to the tree's list and to node's list.
-  void Append(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void Append(OPNode& node, const std::shared_ptr<OP>& op);
   // Moves ops to node's list and points them at it; their places in the
   // tree's list (the processing order) do not change.
-  void MoveOPs(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to,
+  void MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to,
                const std::vector<std::shared_ptr<OP>>& moved);
   // Parses and folds in one line; scratch keeps its strings' capacity from
   // line to line.
@@ -90,19 +88,16 @@ class ORVEX_EXPORT OPTree {
   // InsertEvent's work, on an Event or on the fields of a parsed line.
   template <typename Fields>
   void Insert(const Fields& ev);
-  // GetNodeByPath's walk from the root; indexes the node of a canonical path
-  // under hash.
-  std::shared_ptr<OPNode> WalkPath(const std::string& path, uint64_t hash);
-  // The full-path index: a cache from canonical path to node, so that a
-  // path seen before costs one hash instead of one lookup per component.
-  // Nodes are never removed from a tree, so an entry never goes stale.
-  OPNode* FindIndexed(std::string_view path, uint64_t hash) const;
-  void AddIndexed(uint64_t hash, OPNode* node);
-
-  struct PathSlot {
-    uint64_t hash;
-    OPNode* node;  // null: free slot
-  };
+  // GetNodeByPath without the shared reference: a path seen before, or a new
+  // name in a directory seen before, costs one probe of the node index.
+  OPNode* NodeOf(const std::string& path);
+  // GetNodeByPath's walk from the root, component by component.
+  OPNode* WalkPath(const std::string& path);
+  // The handlers' work, without copying shared references on the way; the
+  // public handlers wrap these.
+  void FoldReindex(OPNode& node, const std::shared_ptr<OP>& op);
+  void FoldRename(OPNode& node, const std::shared_ptr<OP>& op);
+  void FollowRename(OPNode& source, const std::shared_ptr<OPNode>& target);
 
   bool crashed_ = false;
   std::string queue_path_;
@@ -113,11 +108,6 @@ class ORVEX_EXPORT OPTree {
   // The op of the event being folded in: the one cancelled op that may still
   // be revived (by a later bit of the same event), so it is never pruned.
   const OP* in_flight_ = nullptr;
-  // Open addressing with linear probing; the size a power of two, at most
-  // half full. Slots hold only the path's hash: a candidate is confirmed by
-  // comparing the path with its chain of names.
-  std::vector<PathSlot> path_index_;
-  size_t path_index_used_ = 0;
 };
 
 }  // namespace fileindex
