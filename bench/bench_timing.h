@@ -6,7 +6,9 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstddef>
 #include <functional>
+#include <vector>
 
 namespace orvex {
 namespace bench {
@@ -22,6 +24,18 @@ inline double Fastest(const std::function<double()>& run, int repeats = 3) {
   double best = run();
   for (int i = 1; i < repeats; ++i) best = std::min(best, run());
   return best;
+}
+
+// Pushes what a set-up step just wrote out of the processor's caches by
+// writing over a buffer larger than any of them. A timed step on a large
+// structure then starts from memory whatever the structure's size, and a
+// doubling ratio measures the work rather than how much more of the smaller
+// structure was still cached.
+inline void EvictCaches() {
+  constexpr size_t kBytes = size_t{512} << 20;
+  constexpr size_t kLine = 64;
+  static std::vector<unsigned char> sweep(kBytes);
+  for (size_t i = 0; i < kBytes; i += kLine) ++sweep[i];
 }
 
 }  // namespace bench

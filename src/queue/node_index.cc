@@ -39,6 +39,26 @@ uint64_t NodeIndex::ChildKey(uint64_t parent_key, std::string_view name) {
   return Mix(parent_key * 0x9e3779b97f4a7c15ULL + std::hash<std::string_view>()(name));
 }
 
+PathKeys NodeIndex::KeysOf(std::string_view path) {
+  PathKeys keys;
+  if (path.size() < 2 || path.front() != '/' || path.back() == '/') return keys;
+  // One pass over the bytes: components are short, and a search call per
+  // component would cost more than it saves.
+  uint64_t key = kRootKey;
+  size_t start = 1;
+  for (size_t i = 1; i <= path.size(); ++i) {
+    if (i < path.size() && path[i] != '/') continue;
+    if (i == start) return keys;  // an empty component: "//"
+    keys.dir_key = key;
+    keys.name_start = start;
+    key = ChildKey(key, path.substr(start, i - start));
+    start = i + 1;
+  }
+  keys.canonical = true;
+  keys.key = key;
+  return keys;
+}
+
 template <typename Match>
 OPNode* NodeIndex::Find(uint64_t key, Match match) const {
   if (slots_.empty()) return nullptr;
@@ -82,6 +102,10 @@ void NodeIndex::Place(const Slot& slot) {
 
 void NodeIndex::Prefetch(uint64_t key) const {
   if (!slots_.empty()) __builtin_prefetch(&slots_[key & (slots_.size() - 1)]);
+}
+
+const OPNode* NodeIndex::Candidate(uint64_t key) const {
+  return Find(key, [](const OPNode*) { return true; });
 }
 
 void NodeIndex::Retire() {

@@ -17,12 +17,21 @@ namespace fileindex {
 
 class OPNode;
 
+// The keys a path's lookup needs, computed from its components.
+struct PathKeys {
+  bool canonical = false;  // absolute, no empty component, no trailing slash
+  uint64_t key = 0;        // of the path (when canonical)
+  uint64_t dir_key = 0;    // of its directory
+  size_t name_start = 0;   // where its last component starts
+};
+
 class NodeIndex {
  public:
   // The key of a node that heads an index (a tree's root).
   static constexpr uint64_t kRootKey = 0x6f7276657821ULL;
 
   static uint64_t ChildKey(uint64_t parent_key, std::string_view name);
+  static PathKeys KeysOf(std::string_view path);
 
   // The child of parent named name (exact bytes), or null.
   OPNode* FindChild(uint64_t key, const OPNode* parent, std::string_view name) const;
@@ -32,6 +41,9 @@ class NodeIndex {
   void Add(uint64_t key, OPNode* node);
   // Starts loading the slot of key into the cache.
   void Prefetch(uint64_t key) const;
+  // The first node recorded under key, not confirmed to be the one sought:
+  // good for starting to load memory early, for nothing else.
+  const OPNode* Candidate(uint64_t key) const;
 
   // Forgets every node for good: the tree is being dropped and its nodes may
   // be freed, so nothing may be looked up or recorded here any more.

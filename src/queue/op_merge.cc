@@ -7,6 +7,7 @@
 #include "orvex/queue/op_tree.h"
 #include "queue/event_parser.h"
 #include "queue/node_index.h"
+#include "queue/prefetch.h"
 
 namespace orvex {
 namespace fileindex {
@@ -80,16 +81,21 @@ void ForEachPending(OPNode& node, Fn f) {
 }
 
 // Calls f on every node below node, in no particular order; f must not
-// create nodes.
+// create nodes. A large subtree is scattered over the heap, and waiting for
+// each node, then its op list, then its ops would dominate the walk: the
+// nodes are visited breadth first from a list, with the memory of the nodes
+// a few places further on loading meanwhile.
 template <typename Fn>
 void ForEachDescendant(OPNode& node, Fn f) {
-  std::vector<OPNode*> stack;
-  for (const auto& child : node.children()) stack.push_back(child.get());
-  while (!stack.empty()) {
-    OPNode* descendant = stack.back();
-    stack.pop_back();
-    for (const auto& child : descendant->children()) stack.push_back(child.get());
-    f(*descendant);
+  constexpr size_t kAhead = 8;  // places between two loading stages
+  std::vector<OPNode*> nodes;
+  for (const auto& child : node.children()) nodes.push_back(child.get());
+  for (size_t i = 0; i < nodes.size(); ++i) {
+    if (i + 3 * kAhead < nodes.size()) PrefetchNodeLists(nodes[i + 3 * kAhead]);
+    if (i + 2 * kAhead < nodes.size()) PrefetchOpList(nodes[i + 2 * kAhead]);
+    if (i + kAhead < nodes.size()) PrefetchOps(nodes[i + kAhead]);
+    for (const auto& child : nodes[i]->children()) nodes.push_back(child.get());
+    f(*nodes[i]);
   }
 }
 
@@ -119,11 +125,11 @@ class InFlight {
 
 }  // namespace
 
-void OPTree::InsertEvent(std::shared_ptr<Event> ev) { Insert(*ev); }
+void OPTree::InsertEvent(std::shared_ptr<Event> ev) { Insert(*ev, NodeIndex::KeysOf(ev->path)); }
 
 template <typename Fields>
-void OPTree::Insert(const Fields& ev) {
-  OPNode& node = *NodeOf(ev.path);
+void OPTree::Insert(const Fields& ev, const PathKeys& keys) {
+  OPNode& node = *NodeOf(ev.path, keys);
   // One op object for every bit of the event: a mask with several bits runs
   // several handlers on it, which can revive or absorb it in turn.
   auto op = std::make_shared<OP>(node.shared_from_this(), OP_NONE, std::string(), Json::Value());
@@ -151,7 +157,7 @@ void OPTree::Insert(const Fields& ev) {
   if (mask & EVENT_QUEUE_CRASHED) crashed_ = true;
 }
 
-template void OPTree::Insert<EventFields>(const EventFields& ev);
+template void OPTree::Insert<EventFields>(const EventFields& ev, const PathKeys& keys);
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
   FoldSimple(*node, op, OP_UPSERT, kCreateRules,

@@ -12,6 +12,7 @@
 #include "queue/event_parser.h"
 #include "queue/line_reader.h"
 #include "queue/node_index.h"
+#include "queue/prefetch.h"
 
 namespace orvex {
 namespace fileindex {
@@ -19,10 +20,10 @@ namespace {
 
 constexpr char kLogSource[] = "optree";
 
-bool IsCanonical(const std::string& path) {
-  return path.size() > 1 && path.front() == '/' && path.back() != '/' &&
-         path.find("//") == std::string::npos;
-}
+constexpr size_t kAheadLines = 16;          // the lines in flight
+constexpr size_t kAheadBytes = 1 << 20;     // but no more bytes than this
+constexpr size_t kStageDistance = 4;        // lines between two loading stages
+constexpr size_t kKeepCapacity = 64 << 10;  // a line buffer shrinks beyond this
 
 }  // namespace
 
@@ -47,66 +48,116 @@ OPTree::~OPTree() {
   while (!nodes.empty()) nodes.pop_back();
 }
 
+// BuildTree reads a few lines ahead of the one it folds in. Each line is
+// scanned as it arrives, and the memory its fold will touch (the index slot
+// of its path, the node, the node's op list, the ops) starts loading one
+// stage at a time while the lines after it are read, so that the cache
+// misses of a line overlap the work on the next ones. Folding itself stays
+// strictly in line order, and nothing read ahead is logged or counted before
+// its turn: reading ahead changes the timing and nothing else.
+struct OPTree::AheadLine {
+  std::string text;
+  EventFields fields;
+  bool scanned = false;  // fields hold the line; otherwise it is parsed in turn
+  PathKeys keys;
+  const OPNode* candidate = nullptr;
+};
+
 void OPTree::BuildTree() {
   LineReader reader(queue_path_);
   ORVEX_CHECK_AS(!reader.ok(), "!input_stream", kErrorSystem,
                  "Failed to open queue, reason=" + std::string(strerror(errno)));
-  std::string line;
-  EventFields scratch;
-  while (!crashed_ && reader.Next(line)) ProcessLine(line, scratch);
+  const NodeIndex& index = root_->index();
+  std::vector<AheadLine> ring(kAheadLines);
+  size_t first = 0;  // the ring position of the next line to fold
+  size_t count = 0;
+  size_t bytes = 0;
+  bool more = true;
+  auto at = [&ring, &first](size_t age_from_first) -> AheadLine& {
+    return ring[(first + age_from_first) % kAheadLines];
+  };
+  while (!crashed_) {
+    if (more && count < kAheadLines && bytes < kAheadBytes) {
+      AheadLine& line = at(count);
+      // A failed read would leave errno set while the lines before it are
+      // folded; they must see errno as they would without the read.
+      const int saved_errno = errno;
+      more = reader.Next(line.text);
+      errno = saved_errno;
+      if (!more) continue;
+      line.fields.is_dir = false;
+      line.fields.path_old.clear();
+      line.fields.data = Json::Value();
+      line.scanned = ParseEventFast(line.text, line.fields);
+      line.keys = line.scanned ? NodeIndex::KeysOf(line.fields.path) : PathKeys();
+      line.candidate = nullptr;
+      if (line.keys.canonical) index.Prefetch(line.keys.key);
+      bytes += line.text.size();
+      ++count;
+      // The stages, by how far each line is behind the newest.
+      if (count > kStageDistance) {
+        AheadLine& older = at(count - 1 - kStageDistance);
+        if (older.keys.canonical) older.candidate = index.Candidate(older.keys.key);
+        if (older.candidate != nullptr) PrefetchNode(older.candidate);
+      }
+      if (count > 2 * kStageDistance) {
+        const OPNode* node = at(count - 1 - 2 * kStageDistance).candidate;
+        if (node != nullptr) PrefetchOpList(node);
+      }
+      if (count > 3 * kStageDistance) {
+        const OPNode* node = at(count - 1 - 3 * kStageDistance).candidate;
+        if (node != nullptr) PrefetchOps(node);
+      }
+      continue;
+    }
+    if (count == 0) break;
+    AheadLine& line = at(0);
+    bytes -= line.text.size();
+    FoldLine(line);
+    first = (first + 1) % kAheadLines;
+    --count;
+  }
 }
 
-void OPTree::ProcessLine(const std::string& line, EventFields& scratch) {
+void OPTree::FoldLine(AheadLine& line) {
   ++lines_read_;
-  if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.c_str());
+  if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.text.c_str());
   try {
     // What Event's constructor does, without a heap object per line: the
-    // common shape is scanned into the reused fields, anything else parsed
-    // afresh by the JSON parser.
-    scratch.is_dir = false;
-    scratch.path_old.clear();
-    scratch.data = Json::Value();
-    if (ParseEventFast(line, scratch)) {
-      Insert(scratch);
+    // common shape was scanned into the line's fields, anything else is
+    // parsed afresh by the JSON parser.
+    if (line.scanned) {
+      Insert(line.fields, line.keys);
     } else {
       EventFields parsed;
-      ParseEventJson(line, parsed);
-      Insert(parsed);
+      ParseEventJson(line.text, parsed);
+      Insert(parsed, NodeIndex::KeysOf(parsed.path));
     }
   } catch (const Error& e) {
     ++lines_skipped_;
     LogErrno("%s:%d (%d, %u) InsertEvent failed, event_raw=%s, code=%d, reason=%s", kLogSource,
              __LINE__, static_cast<int>(::getpid()), static_cast<unsigned>(::geteuid()),
-             line.c_str(), static_cast<int>(e.code()), e.reason().c_str());
+             line.text.c_str(), static_cast<int>(e.code()), e.reason().c_str());
   }
+  if (line.text.capacity() > kKeepCapacity) std::string().swap(line.text);
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
   return NodeOf(path)->shared_from_this();
 }
 
-OPNode* OPTree::NodeOf(const std::string& path) {
-  if (!IsCanonical(path)) return WalkPath(path);
-  // The keys of the path and of its directory, from the components.
-  uint64_t dir_key = NodeIndex::kRootKey;
-  uint64_t key = NodeIndex::kRootKey;
-  size_t last = 1;
-  for (size_t pos = 1; pos <= path.size();) {
-    size_t next = path.find('/', pos);
-    if (next == std::string::npos) next = path.size();
-    dir_key = key;
-    key = NodeIndex::ChildKey(key, std::string_view(path).substr(pos, next - pos));
-    last = pos;
-    pos = next + 1;
-  }
+OPNode* OPTree::NodeOf(const std::string& path) { return NodeOf(path, NodeIndex::KeysOf(path)); }
+
+OPNode* OPTree::NodeOf(const std::string& path, const PathKeys& keys) {
+  if (!keys.canonical) return WalkPath(path);
   NodeIndex& index = root_->index();
-  if (OPNode* known = index.FindPath(key, path)) return known;
+  if (OPNode* known = index.FindPath(keys.key, path)) return known;
   // Every node of the tree is in the index, so a directory found there with
   // the path missing is a directory without that entry yet.
-  const std::string_view dir(path.data(), last - 1);
-  OPNode* parent = dir.empty() ? root_.get() : index.FindPath(dir_key, dir);
+  const std::string_view dir(path.data(), keys.name_start - 1);
+  OPNode* parent = dir.empty() ? root_.get() : index.FindPath(keys.dir_key, dir);
   if (parent == nullptr) return WalkPath(path);
-  return parent->AddChild(std::string_view(path).substr(last), key);
+  return parent->AddChild(std::string_view(path).substr(keys.name_start), keys.key);
 }
 
 OPNode* OPTree::WalkPath(const std::string& path) {
@@ -125,7 +176,9 @@ OPNode* OPTree::WalkPath(const std::string& path) {
     }
     pos = next + 1;
   }
-  if (!IsCanonical(path)) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
+  if (!NodeIndex::KeysOf(path).canonical) {
+    throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
+  }
   return node.get();
 }
 

@@ -20,6 +20,7 @@ namespace orvex {
 namespace fileindex {
 
 struct EventFields;
+struct PathKeys;
 
 class ORVEX_EXPORT OPTree {
  public:
@@ -82,14 +83,17 @@ class ORVEX_EXPORT OPTree {
   // tree's list (the processing order) do not change.
   void MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to,
                const std::vector<std::shared_ptr<OP>>& moved);
-  // Parses and folds in one line; scratch keeps its strings' capacity from
-  // line to line.
-  void ProcessLine(const std::string& line, EventFields& scratch);
-  // InsertEvent's work, on an Event or on the fields of a parsed line.
+  // A line BuildTree has read ahead of the one it folds in.
+  struct AheadLine;
+  // Folds in one line read ahead, in line order.
+  void FoldLine(AheadLine& line);
+  // InsertEvent's work, on an Event or on the fields of a parsed line, with
+  // the keys of its path.
   template <typename Fields>
-  void Insert(const Fields& ev);
+  void Insert(const Fields& ev, const PathKeys& keys);
   // GetNodeByPath without the shared reference: a path seen before, or a new
   // name in a directory seen before, costs one probe of the node index.
+  OPNode* NodeOf(const std::string& path, const PathKeys& keys);
   OPNode* NodeOf(const std::string& path);
   // GetNodeByPath's walk from the root, component by component.
   OPNode* WalkPath(const std::string& path);
