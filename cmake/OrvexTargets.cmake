@@ -59,7 +59,11 @@ function(orvex_shared_library)
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
   set_target_properties(fileindex PROPERTIES
     VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR})
-  target_link_options(fileindex PRIVATE -Wl,--no-undefined)
+  # Every symbol must resolve at link time, except under clang's sanitizers,
+  # whose runtime only the executable brings.
+  if(NOT (ORVEX_BUILD_FUZZ OR (ORVEX_SANITIZE AND CMAKE_CXX_COMPILER_ID STREQUAL "Clang")))
+    target_link_options(fileindex PRIVATE -Wl,--no-undefined)
+  endif()
 endfunction()
 
 # Each directory under programs/ is one program named after it. Programs use
@@ -124,15 +128,20 @@ function(orvex_tests)
   endforeach()
 endfunction()
 
-# bench/*.cc: one program each, printing its own figures.
+# bench/*.cc: one program each, printing its own figures; those named
+# *_micro.cc are Google Benchmark programs.
 function(orvex_benchmarks)
   orvex_all_internal(libs)
+  find_package(benchmark REQUIRED)
   file(GLOB srcs CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/bench/*.cc)
   foreach(src ${srcs})
     get_filename_component(name ${src} NAME_WE)
     add_executable(${name} ${src})
     target_link_libraries(${name} PRIVATE ${libs})
     target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src)
+    if(name MATCHES "_micro$")
+      target_link_libraries(${name} PRIVATE benchmark::benchmark)
+    endif()
   endforeach()
 endfunction()
 

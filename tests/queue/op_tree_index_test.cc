@@ -103,6 +103,37 @@ TEST_F(OPTreeIndexTest, ABigDirectoryKeepsItsOrderAndFindsEveryName) {
   EXPECT_EQ(big->children().size(), made.size() + 1);
 }
 
+TEST_F(OPTreeIndexTest, ALooseNodeNamedLikeATreeNodeKeepsItsChildrenApart) {
+  auto tree = EmptyTree();
+  auto real = tree->GetNodeByPath("/a");
+  // Made by hand with a tree node as parent, never its child: what it
+  // creates must not answer for the tree's paths, nor the other way round.
+  auto loose = std::make_shared<OPNode>(tree->root(), "a");
+  auto loose_child = loose->GetChild("x");
+  auto real_child = tree->GetNodeByPath("/a/x");
+  EXPECT_NE(real_child, loose_child);
+  EXPECT_EQ(real_child->parent(), real);
+  EXPECT_EQ(loose->GetChild("x"), loose_child);
+  EXPECT_EQ(real->GetChild("x"), real_child);
+  EXPECT_EQ(loose_child->GetPath(), "/a/x");
+}
+
+TEST_F(OPTreeIndexTest, NodesHeldAfterTheTreeIsGoneStillGrowAndFindChildren) {
+  std::shared_ptr<OPNode> dir;
+  {
+    auto tree = EmptyTree();
+    dir = tree->GetNodeByPath("/s/dir");
+    for (int i = 0; i < 100; ++i) tree->GetNodeByPath("/s/dir/f" + std::to_string(i));
+  }
+  // The tree cut its links: the kept node starts over, and its new children
+  // are found again by name.
+  EXPECT_TRUE(dir->children().empty());
+  auto made = dir->GetChild("later");
+  EXPECT_EQ(dir->GetChild("later"), made);
+  EXPECT_EQ(made->GetPath(), "/s/dir/later");
+  EXPECT_EQ(dir->children().size(), 1u);
+}
+
 }  // namespace
 }  // namespace fileindex
 }  // namespace orvex

@@ -237,10 +237,17 @@ TEST_F(OPTreeTest, CrashMarkStopsReadingAndBecomesOneWholeShareOp) {
   Create("/s/a");
   Modify("/s/b");
   Push(EVENT_QUEUE_CRASHED, "/s");
-  Create("/s/c");
+  // Lines after the mark are never looked at: neither counted nor logged,
+  // however many of them there are.
+  for (int i = 0; i < 40; ++i) {
+    Create("/s/c" + std::to_string(i));
+    Raw("not json");
+  }
   auto tree = Build();
   EXPECT_TRUE(tree->crashed());
   EXPECT_EQ(tree->lines_read(), 3u);
+  EXPECT_EQ(tree->lines_skipped(), 0u);
+  EXPECT_TRUE(log_.Matching("event_raw=").empty());
   std::vector<std::string> out;
   int count = tree->ProcessOP([&out, &tree](std::shared_ptr<OP> op) {
     std::ostringstream text;
