@@ -12,18 +12,13 @@
 #include "queue/event_parser.h"
 #include "queue/line_reader.h"
 #include "queue/node_index.h"
-#include "queue/prefetch.h"
+#include "queue/read_ahead.h"
 
 namespace orvex {
 namespace fileindex {
 namespace {
 
 constexpr char kLogSource[] = "optree";
-
-constexpr size_t kAheadLines = 16;          // the lines in flight
-constexpr size_t kAheadBytes = 1 << 20;     // but no more bytes than this
-constexpr size_t kStageDistance = 4;        // lines between two loading stages
-constexpr size_t kKeepCapacity = 64 << 10;  // a line buffer shrinks beyond this
 
 }  // namespace
 
@@ -48,78 +43,19 @@ OPTree::~OPTree() {
   while (!nodes.empty()) nodes.pop_back();
 }
 
-// BuildTree reads a few lines ahead of the one it folds in. Each line is
-// scanned as it arrives, and the memory its fold will touch (the index slot
-// of its path, the node, the node's op list, the ops) starts loading one
-// stage at a time while the lines after it are read, so that the cache
-// misses of a line overlap the work on the next ones. Folding itself stays
-// strictly in line order, and nothing read ahead is logged or counted before
-// its turn: reading ahead changes the timing and nothing else.
-struct OPTree::AheadLine {
-  std::string text;
-  EventFields fields;
-  bool scanned = false;  // fields hold the line; otherwise it is parsed in turn
-  PathKeys keys;
-  const OPNode* candidate = nullptr;
-};
-
 void OPTree::BuildTree() {
   LineReader reader(queue_path_);
   ORVEX_CHECK_AS(!reader.ok(), "!input_stream", kErrorSystem,
                  "Failed to open queue, reason=" + std::string(strerror(errno)));
-  const NodeIndex& index = root_->index();
-  std::vector<AheadLine> ring(kAheadLines);
-  size_t first = 0;  // the ring position of the next line to fold
-  size_t count = 0;
-  size_t bytes = 0;
-  bool more = true;
-  auto at = [&ring, &first](size_t age_from_first) -> AheadLine& {
-    return ring[(first + age_from_first) % kAheadLines];
-  };
+  ReadAhead lines(reader, root_->index());
   while (!crashed_) {
-    if (more && count < kAheadLines && bytes < kAheadBytes) {
-      AheadLine& line = at(count);
-      // A failed read would leave errno set while the lines before it are
-      // folded; they must see errno as they would without the read.
-      const int saved_errno = errno;
-      more = reader.Next(line.text);
-      errno = saved_errno;
-      if (!more) continue;
-      line.fields.is_dir = false;
-      line.fields.path_old.clear();
-      line.fields.data = Json::Value();
-      line.scanned = ParseEventFast(line.text, line.fields);
-      line.keys = line.scanned ? NodeIndex::KeysOf(line.fields.path) : PathKeys();
-      line.candidate = nullptr;
-      if (line.keys.canonical) index.Prefetch(line.keys.key);
-      bytes += line.text.size();
-      ++count;
-      // The stages, by how far each line is behind the newest.
-      if (count > kStageDistance) {
-        AheadLine& older = at(count - 1 - kStageDistance);
-        if (older.keys.canonical) older.candidate = index.Candidate(older.keys.key);
-        if (older.candidate != nullptr) PrefetchNode(older.candidate);
-      }
-      if (count > 2 * kStageDistance) {
-        const OPNode* node = at(count - 1 - 2 * kStageDistance).candidate;
-        if (node != nullptr) PrefetchOpList(node);
-      }
-      if (count > 3 * kStageDistance) {
-        const OPNode* node = at(count - 1 - 3 * kStageDistance).candidate;
-        if (node != nullptr) PrefetchOps(node);
-      }
-      continue;
-    }
-    if (count == 0) break;
-    AheadLine& line = at(0);
-    bytes -= line.text.size();
-    FoldLine(line);
-    first = (first + 1) % kAheadLines;
-    --count;
+    AheadLine* line = lines.Next();
+    if (line == nullptr) break;
+    FoldLine(*line);
   }
 }
 
-void OPTree::FoldLine(AheadLine& line) {
+void OPTree::FoldLine(const AheadLine& line) {
   ++lines_read_;
   if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.text.c_str());
   try {
@@ -139,7 +75,6 @@ void OPTree::FoldLine(AheadLine& line) {
              __LINE__, static_cast<int>(::getpid()), static_cast<unsigned>(::geteuid()),
              line.text.c_str(), static_cast<int>(e.code()), e.reason().c_str());
   }
-  if (line.text.capacity() > kKeepCapacity) std::string().swap(line.text);
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {

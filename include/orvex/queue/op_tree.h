@@ -19,6 +19,7 @@
 namespace orvex {
 namespace fileindex {
 
+struct AheadLine;
 struct EventFields;
 struct PathKeys;
 
@@ -83,10 +84,8 @@ class ORVEX_EXPORT OPTree {
   // tree's list (the processing order) do not change.
   void MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to,
                const std::vector<std::shared_ptr<OP>>& moved);
-  // A line BuildTree has read ahead of the one it folds in.
-  struct AheadLine;
-  // Folds in one line read ahead, in line order.
-  void FoldLine(AheadLine& line);
+  // Folds in one line of the queue file (read ahead of its turn).
+  void FoldLine(const AheadLine& line);
   // InsertEvent's work, on an Event or on the fields of a parsed line, with
   // the keys of its path.
   template <typename Fields>
