@@ -151,6 +151,17 @@ void OPNode::DetachOPs(const std::vector<std::shared_ptr<OP>>& moved) {
              ops_.end());
 }
 
+void OPNode::ReleaseTree(const std::shared_ptr<OPNode>& head) {
+  // The index goes first: it must not outlive the nodes it points to.
+  head->index_->Retire();
+  std::vector<std::shared_ptr<OPNode>> nodes{head};
+  for (size_t i = 0; i < nodes.size(); ++i) {
+    for (const auto& child : nodes[i]->children_) nodes.push_back(child);
+  }
+  for (const auto& node : nodes) node->ReleaseLinks();
+  while (!nodes.empty()) nodes.pop_back();
+}
+
 void OPNode::ReleaseLinks() {
   children_.clear();
   ops_.clear();

@@ -29,20 +29,11 @@ OPTree::OPTree(const std::string& queue_path)
 
 OPTree::~OPTree() {
   // Nodes link to their parents and ops to their nodes with owning pointers,
-  // and nodes own their children and ops: cut the downward links, then free
-  // the nodes deepest first so no destructor recurses down a long path. The
-  // index goes first: it must not outlive the nodes it points to.
-  root_->index().Retire();
+  // and nodes own their children and ops: nothing would be freed without
+  // cutting the downward links.
   ops_.clear();
-  std::vector<std::shared_ptr<OPNode>> nodes{root_};
-  for (size_t i = 0; i < nodes.size(); ++i) {
-    for (const auto& child : nodes[i]->children()) nodes.push_back(child);
-  }
-  for (const auto& node : nodes) node->ReleaseLinks();
-  root_.reset();
-  while (!nodes.empty()) nodes.pop_back();
+  OPNode::ReleaseTree(root_);
 }
-
 void OPTree::BuildTree() {
   LineReader reader(queue_path_);
   ORVEX_CHECK_AS(!reader.ok(), "!input_stream", kErrorSystem,

@@ -95,10 +95,15 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   void AttachOP(std::shared_ptr<OP> op, const OP* keep);
   // Removes every occurrence of the given ops from this node's list.
   void DetachOPs(const std::vector<std::shared_ptr<OP>>& moved);
-  // Drops the downward links (children and ops) so that a dropped tree
-  // releases its nodes; used only by OPTree's destructor, which first
-  // retires the tree's index.
-  void ReleaseLinks();
+
+  // Parents and children own each other, so nodes are freed only once these
+  // links are cut. Cuts the downward links (children and ops) of head and of
+  // every node below it, which frees, deepest first and without recursion,
+  // every node that no one else holds. OPTree's destructor does this for its
+  // tree; nodes made outside a tree, or grown from a node kept after its tree
+  // was dropped, need it from their owner. Lookups in head's tree work
+  // afterwards, but no longer through its index.
+  static void ReleaseTree(const std::shared_ptr<OPNode>& head);
 
  private:
   friend class OPTree;
@@ -108,6 +113,8 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   // the caller knows there is none yet.
   OPNode* AddChild(std::string_view name, uint64_t key);
   NodeIndex& index() const { return *index_; }
+  // Drops this node's own downward links.
+  void ReleaseLinks();
   uint64_t key() const { return key_; }
 
   std::string name_;
