@@ -15,6 +15,7 @@
 
 #include "orvex/config/folder.h"
 #include "orvex/config/folder_mgr.h"
+#include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "platform/share_test_root.h"
 
@@ -25,35 +26,43 @@ using fileindex::Folder;
 using fileindex::FolderMgr;
 using FolderPtr = std::shared_ptr<Folder>;
 
-// A folder record's JSON, flags given as "davp" letters: "d" document,
-// "a" audio, "v" video, "p" photo.
+// The Error code a call throws (its reason in *reason); 0 when it returns.
+template <typename Call>
+int CodeOf(Call call, std::string* reason = nullptr) {
+  try {
+    call();
+  } catch (const Error& e) {
+    if (reason != nullptr) *reason = e.reason();
+    return e.code();
+  }
+  return 0;
+}
+
+constexpr const char* kTypeKeys[] = {"document", "audio", "video", "photo"};
+
+// A folder record's JSON, flags as letters of "davp": document, audio,
+// video, photo.
 inline Json::Value FolderJson(const std::string& path, const std::string& flags,
                               const std::string& name = "", bool paused = false) {
   Json::Value folder(Json::objectValue);
   folder["path"] = path;
   folder["name"] = name.empty() ? path : name;
-  folder["document"] = flags.find('d') != std::string::npos;
-  folder["audio"] = flags.find('a') != std::string::npos;
-  folder["video"] = flags.find('v') != std::string::npos;
-  folder["photo"] = flags.find('p') != std::string::npos;
+  for (int i = 0; i < 4; ++i) folder[kTypeKeys[i]] = flags.find("davp"[i]) != std::string::npos;
   folder["paused"] = paused;
   folder["volume_to_be_clean"] = "";
   return folder;
 }
 
 inline FolderPtr MakeFolder(const std::string& path, const std::string& flags,
-                            const std::string& name = "") {
-  return std::make_shared<Folder>(FolderJson(path, flags, name));
+                            const std::string& name = "", bool paused = false) {
+  return std::make_shared<Folder>(FolderJson(path, flags, name, paused));
 }
 
-// The four type flags of a record as "davp" letters ("-" for off), for
-// one-line comparisons of change reports.
+// The four type flags as "davp" letters, "-" for off.
 inline std::string Flags(const FolderPtr& folder) {
+  const bool on[] = {folder->IsDocument(), folder->IsAudio(), folder->IsVideo(), folder->IsPhoto()};
   std::string flags = "----";
-  if (folder->IsDocument()) flags[0] = 'd';
-  if (folder->IsAudio()) flags[1] = 'a';
-  if (folder->IsVideo()) flags[2] = 'v';
-  if (folder->IsPhoto()) flags[3] = 'p';
+  for (int i = 0; i < 4; ++i) flags[i] = on[i] ? "davp"[i] : '-';
   return flags;
 }
 
@@ -66,16 +75,15 @@ inline std::vector<std::string> Paths(const std::vector<FolderPtr>& folders) {
 class FolderTestRoot : public ShareTestRoot {
  protected:
   std::string FoldersFile() const { return dir_.Join("var/packages/Orvex/etc/fileindex.folders"); }
-  std::string StatusFile() const { return dir_.Join("var/packages/Orvex/etc/fileindex.status"); }
 
-  void WriteFoldersText(const std::string& text) {
+  void WriteEtc(const std::string& name, const std::string& text) {
     std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
-    dir_.Write("var/packages/Orvex/etc/fileindex.folders", text);
+    dir_.Write("var/packages/Orvex/etc/" + name, text);
   }
   void WriteFolders(const std::vector<Json::Value>& folders) {
     Json::Value list(Json::arrayValue);
     for (const Json::Value& folder : folders) list.append(folder);
-    WriteFoldersText(toString(list));
+    WriteEtc("fileindex.folders", toString(list));
   }
   Json::Value ReadFolders() const {
     Json::Value list;
@@ -88,26 +96,18 @@ class FolderTestRoot : public ShareTestRoot {
     Json::Value status(Json::objectValue);
     status["resume_time"] = static_cast<Json::Int64>(resume_time);
     if (!share.empty()) status["share"][share] = flags;
-    std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
-    dir_.Write("var/packages/Orvex/etc/fileindex.status", toString(status));
+    WriteEtc("fileindex.status", toString(status));
   }
 
-  // Appends event lines to the share's live queue (or its snapshot).
-  static void WriteQueue(const std::string& share_root, const std::vector<Json::Value>& events,
-                         bool snapshot = false) {
-    const std::string dir = share_root + "/@eaDir/@fileindex";
-    std::filesystem::create_directories(dir);
-    std::string text;
-    for (const Json::Value& event : events) text += toString(event) + "\n";
-    std::ofstream(dir + (snapshot ? "/queue.tmp" : "/queue"), std::ios::app) << text;
-  }
-  static Json::Value CreateEvent(const std::string& path, const std::string& path_old = "") {
+  // Appends a file's create event to the share's live queue.
+  static void QueueCreate(const std::string& share_root, const std::string& path) {
     Json::Value event(Json::objectValue);
-    event["event"] = path_old.empty() ? 64 : 256;
+    event["event"] = 64;
     event["is_dir"] = false;
     event["path"] = path;
-    if (!path_old.empty()) event["path_old"] = path_old;
-    return event;
+    std::filesystem::create_directories(share_root + "/@eaDir/@fileindex");
+    std::ofstream(share_root + "/@eaDir/@fileindex/queue", std::ios::app)
+        << toString(event) << "\n";
   }
 };
 
