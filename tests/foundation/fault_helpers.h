@@ -1,0 +1,64 @@
+// Helpers for failure-path tests: the exact log line of a failed check, and a
+// lowered resource limit that makes system calls fail even for root. One
+// thread at a time (ScopedRlimit changes the whole process).
+#ifndef ORVEX_TESTS_FOUNDATION_FAULT_HELPERS_H_
+#define ORVEX_TESTS_FOUNDATION_FAULT_HELPERS_H_
+
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <string>
+
+namespace orvex {
+namespace testing {
+
+// line with the number after its leading "<source>:" replaced by "N"; line
+// itself when it does not start that way.
+inline std::string WithoutLineNumber(const std::string& line) {
+  const size_t colon = line.find(':');
+  if (colon == std::string::npos) return line;
+  const size_t end = line.find_first_not_of("0123456789", colon + 1);
+  if (end == colon + 1 || end == std::string::npos || line[end] != ' ') return line;
+  return line.substr(0, colon + 1) + "N" + line.substr(end);
+}
+
+// The line a failed check in source writes, as WithoutLineNumber shows it
+// (without the " [err: ...]" suffix of a check that left errno set).
+inline std::string CheckLine(const std::string& source, const std::string& condition,
+                             const std::string& reason) {
+  return source + ":N (" + std::to_string(::getpid()) + ", " + std::to_string(::geteuid()) +
+         ") Failed [" + condition + "], reason: " + reason;
+}
+
+// Lowers one resource limit for a scope. Writes past an RLIMIT_FSIZE limit
+// fail with EFBIG instead of raising SIGXFSZ: a full disk in miniature.
+class ScopedRlimit {
+ public:
+  using Resource = decltype(RLIMIT_FSIZE);  // an enum under glibc
+  ScopedRlimit(Resource resource, rlim_t value) : resource_(resource) {
+    handler_ = std::signal(SIGXFSZ, SIG_IGN);
+    ::getrlimit(resource_, &saved_);
+    struct rlimit lowered = saved_;
+    lowered.rlim_cur = value;
+    ok_ = ::setrlimit(resource_, &lowered) == 0;
+  }
+  ScopedRlimit(const ScopedRlimit&) = delete;
+  ScopedRlimit& operator=(const ScopedRlimit&) = delete;
+  ~ScopedRlimit() {
+    ::setrlimit(resource_, &saved_);
+    std::signal(SIGXFSZ, handler_);
+  }
+  bool ok() const { return ok_; }
+
+ private:
+  Resource resource_;
+  struct rlimit saved_;
+  void (*handler_)(int);
+  bool ok_ = false;
+};
+
+}  // namespace testing
+}  // namespace orvex
+
+#endif  // ORVEX_TESTS_FOUNDATION_FAULT_HELPERS_H_
