@@ -18,6 +18,7 @@
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "platform/share_test_root.h"
+#include "support/error_code.h"
 
 namespace orvex {
 namespace testing {
@@ -25,18 +26,6 @@ namespace testing {
 using fileindex::Folder;
 using fileindex::FolderMgr;
 using FolderPtr = std::shared_ptr<Folder>;
-
-// The Error code a call throws (its reason in *reason); 0 when it returns.
-template <typename Call>
-int CodeOf(Call call, std::string* reason = nullptr) {
-  try {
-    call();
-  } catch (const Error& e) {
-    if (reason != nullptr) *reason = e.reason();
-    return e.code();
-  }
-  return 0;
-}
 
 constexpr const char* kTypeKeys[] = {"document", "audio", "video", "photo"};
 

@@ -9,6 +9,7 @@
 #include "orvex/foundation/error.h"
 #include "orvex/policy/indexability.h"
 #include "platform/share_test_root.h"
+#include "support/error_code.h"
 #include "support/log_capture.h"
 
 namespace orvex {
@@ -18,17 +19,7 @@ namespace {
 using testing::LogCapture;
 using testing::Options;
 
-// The Error code a call throws (its reason in *reason); 0 when it returns.
-template <typename Call>
-int CodeOf(Call call, std::string* reason = nullptr) {
-  try {
-    call();
-  } catch (const Error& e) {
-    if (reason != nullptr) *reason = e.reason();
-    return e.code();
-  }
-  return 0;
-}
+using testing::CodeOf;
 
 TEST(SharePathTextTest, ShareNameAndRecycleBinComponents) {
   const std::vector<std::pair<std::string, std::string>> names = {
