@@ -14,8 +14,44 @@ enum class Kind { kString, kNumber, kTrue, kFalse, kNull };
 struct Scalar {
   Kind kind;
   std::string_view text;  // a string's bytes between the quotes
+  bool escaped = false;   // text holds backslash escapes
   uint32_t number = 0;
 };
+
+// The one-letter escapes and what they stand for; any other escape (\u
+// among them) is left to the JSON parser.
+char Unescaped(char letter) {
+  switch (letter) {
+    case '"':
+    case '\\':
+    case '/':
+      return letter;
+    case 'b':
+      return '\b';
+    case 'f':
+      return '\f';
+    case 'n':
+      return '\n';
+    case 'r':
+      return '\r';
+    case 't':
+      return '\t';
+    default:
+      return '\0';
+  }
+}
+
+// Sets out to a string's text, decoding its escapes when it has any.
+void AssignText(std::string& out, std::string_view text, bool escaped) {
+  if (!escaped) {
+    out.assign(text.data(), text.size());
+    return;
+  }
+  out.clear();
+  for (size_t i = 0; i < text.size(); ++i) {
+    out.push_back(text[i] == '\\' ? Unescaped(text[++i]) : text[i]);
+  }
+}
 
 // Reads the accepted subset left to right; every method returns false at the
 // first byte outside it, and the caller then leaves the line to the JSON
@@ -36,9 +72,12 @@ class Scanner {
     return true;
   }
 
-  bool String(std::string_view& out) {
+  // A string with no control bytes and only one-letter escapes: out is its
+  // text as written, escaped whether it holds any.
+  bool String(std::string_view& out, bool& escaped) {
     if (!Consume('"')) return false;
     const char* start = at_;
+    escaped = false;
     for (; at_ < end_; ++at_) {
       const unsigned char c = static_cast<unsigned char>(*at_);
       if (c == '"') {
@@ -46,7 +85,13 @@ class Scanner {
         ++at_;
         return true;
       }
-      if (c == '\\' || c < 0x20) return false;
+      if (c == '\\') {
+        if (end_ - at_ < 2 || Unescaped(at_[1]) == '\0') return false;
+        escaped = true;
+        ++at_;
+      } else if (c < 0x20) {
+        return false;
+      }
     }
     return false;
   }
@@ -56,7 +101,7 @@ class Scanner {
     const char c = *at_;
     if (c == '"') {
       out.kind = Kind::kString;
-      return String(out.text);
+      return String(out.text, out.escaped);
     }
     if (c >= '0' && c <= '9') {
       out.kind = Kind::kNumber;
@@ -118,6 +163,7 @@ struct Members {
   bool is_dir = false;
   std::string_view path;
   std::string_view path_old;
+  bool path_escaped = false, path_old_escaped = false;
 };
 
 // Takes one member; false when it is repeated or of other than its usual type.
@@ -133,6 +179,7 @@ bool Take(Members& m, std::string_view key, const Scalar& value) {
   } else if (key == "path") {
     if (!once(m.has_path) || value.kind != Kind::kString) return false;
     m.path = value.text;
+    m.path_escaped = value.escaped;
   } else if (key == "is_dir") {
     if (!once(m.has_is_dir) || (value.kind != Kind::kTrue && value.kind != Kind::kFalse)) {
       return false;
@@ -141,6 +188,7 @@ bool Take(Members& m, std::string_view key, const Scalar& value) {
   } else if (key == "path_old") {
     if (!once(m.has_path_old) || value.kind != Kind::kString) return false;
     m.path_old = value.text;
+    m.path_old_escaped = value.escaped;
   } else if (key == "data") {
     if (!once(m.has_data) || value.kind != Kind::kNull) return false;
   }
@@ -154,8 +202,10 @@ bool ScanObject(Scanner& in, Members& m) {
   if (in.Peek('}')) return false;  // {} lacks the required members anyway
   for (;;) {
     std::string_view key;
+    bool key_escaped = false;
     Scalar value;
-    if (!in.String(key)) return false;
+    // A key is compared as written: one with escapes goes to the parser.
+    if (!in.String(key, key_escaped) || key_escaped) return false;
     in.SkipBlanks();
     if (!in.Consume(':')) return false;
     in.SkipBlanks();
@@ -176,9 +226,9 @@ bool ParseEventFast(const std::string& line, EventFields& out) {
   Members m;
   if (!ScanObject(in, m) || !m.has_event || !m.has_path) return false;
   out.event = m.event;
-  out.path.assign(m.path.data(), m.path.size());
+  AssignText(out.path, m.path, m.path_escaped);
   if (m.has_is_dir) out.is_dir = m.is_dir;
-  if (m.has_path_old) out.path_old.assign(m.path_old.data(), m.path_old.size());
+  if (m.has_path_old) AssignText(out.path_old, m.path_old, m.path_old_escaped);
   if (m.has_data) out.data = Json::Value();
   return true;
 }

@@ -22,7 +22,8 @@ struct EventFields {
 };
 
 // Parses the lines the daemon and the library write themselves: one flat
-// object of strings without escapes or control bytes, unsigned 32-bit integer
+// object of strings without control bytes and with only one-letter escapes
+// (\" \\ \/ \b \f \n \r \t, not in keys), unsigned 32-bit integer
 // literals, true, false and null, with "event" an integer, "path" a string
 // and, when present, "is_dir" true or false, "path_old" a string and "data"
 // null, none of them repeated. Returns false, leaving out untouched, for any

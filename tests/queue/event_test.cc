@@ -116,14 +116,18 @@ TEST(EventTest, ScannerTakesTheUsualLinesAndLeavesTheRestToTheJsonParser) {
       "{\"event\":2,\"path\":\"/v/s/\xE7\x85\xA7\xE7\x89\x87.jpg\"}",
       " \t{\"event\":0,\"path\":\"\"}\r\n ",
       R"({"event":4294967295,"path":"/a","ts":12345,"x":null,"y":true,"z":"q"})",
+      R"({"event":256,"path":"/v/Family \"best\"/a\\b\/c","path_old":"\b\f\n\r\t\"","z":"\\"})",
   };
   for (const char* line : taken) EXPECT_TRUE(ExpectSameAsJson(line)) << line;
   // What the mutated lines below rarely or never produce: long numbers,
-  // escapes, comments, quotes, a byte order mark, NUL bytes.
+  // unicode and bad escapes, escaped keys, comments, quotes, a byte order
+  // mark, NUL bytes.
   const std::string left[] = {
       R"({"event":99999999999999999999,"path":"/a"})",
-      R"({"event":64,"path":"/a\/b"})",
       R"({"event":64,"path":"/a\u00e9"})",
+      R"({"event":64,"path":"/a\x"})",
+      R"({"event":64,"pa\th":"/a","path":"/b"})",
+      R"({"event":64,"path":"/a\)",
       R"({"event":64,"path":"/a"} // note)",
       R"(/* c */{"event":64,"path":"/a"})",
       R"({'event':64,"path":"/a"})",
@@ -155,6 +159,7 @@ TEST(EventTest, ScannerAgreesWithTheJsonParserOnMutatedLines) {
                                            "\"/v/s/a b.jpg\"",
                                            "\"/v/\xC3\xA9\"",
                                            "\"\\n\"",
+                                           "\"/v/a \\\"b\\\" \\\\ \\/c\"",
                                            "{}",
                                            "[]",
                                            "{\"photo\":true}",
@@ -173,7 +178,7 @@ TEST(EventTest, ScannerAgreesWithTheJsonParserOnMutatedLines) {
       const size_t key = m < 2 && pick(4) != 0 ? m : pick(keys.size());
       line += (m > 0 ? "," : "") + blank() + keys[key] + blank() + ":" + blank();
       if (key < 2 && pick(4) != 0) {
-        line += values[key == 0 ? pick(3) : 11 + pick(3)];
+        line += values[key == 0 ? pick(3) : 11 + pick(5)];
       } else {
         line += values[pick(values.size())];
       }
