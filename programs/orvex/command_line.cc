@@ -1,5 +1,7 @@
 #include "command_line.h"
 
+#include <iostream>
+
 namespace orvex_cli {
 namespace {
 
@@ -37,6 +39,19 @@ ParsedArgs ParseArgs(const Args& args, const std::set<std::string>& allowed, siz
     throw UsageError("unexpected argument " + parsed.positional[max_positional], usage);
   }
   return parsed;
+}
+
+int RunSubcommand(const Args& args, const std::string& group,
+                  const std::vector<Subcommand>& subcommands, const std::string& usage) {
+  if (args.empty()) throw UsageError("missing " + group + " subcommand", usage);
+  if (args[0] == "--help") {
+    std::cout << usage;
+    return kExitOk;
+  }
+  for (const Subcommand& sub : subcommands) {
+    if (args[0] == sub.name) return sub.run(Args(args.begin() + 1, args.end()));
+  }
+  throw UsageError("unknown " + group + " subcommand " + args[0], usage);
 }
 
 }  // namespace orvex_cli

@@ -39,6 +39,18 @@ struct CommandGroup {
   int (*run)(const Args& args);
 };
 
+// One subcommand of a group: `orvex <group> <name> ...`; run receives the
+// arguments after the name.
+struct Subcommand {
+  const char* name;
+  int (*run)(const Args& args);
+};
+
+// Runs the subcommand that args[0] names; "--help" there prints usage.
+// Throws UsageError (carrying usage) for a missing or unknown subcommand.
+int RunSubcommand(const Args& args, const std::string& group,
+                  const std::vector<Subcommand>& subcommands, const std::string& usage);
+
 // Entry points, one group per file (see the command table in main.cc).
 int RunShareCommand(const Args& args);   // share_commands.cc
 int RunStatusCommand(const Args& args);  // status_commands.cc

@@ -203,28 +203,14 @@ int Get(const Args& args) {
   return kExitOk;
 }
 
-struct Subcommand {
-  const char* name;
-  int (*run)(const Args& args);
-};
-
-const Subcommand kSubcommands[] = {
-    {"list", List},
-    {"get", Get},
-};
-
 }  // namespace
 
 int RunFolderCommand(const Args& args) {
-  if (args.empty()) throw UsageError("missing folder subcommand", kFolderUsage);
-  if (args[0] == "--help") {
-    std::cout << kFolderUsage;
-    return kExitOk;
-  }
-  for (const Subcommand& sub : kSubcommands) {
-    if (args[0] == sub.name) return sub.run(Args(args.begin() + 1, args.end()));
-  }
-  throw UsageError("unknown folder subcommand " + args[0], kFolderUsage);
+  static const std::vector<Subcommand> kSubcommands = {
+      {"list", List},
+      {"get", Get},
+  };
+  return RunSubcommand(args, "folder", kSubcommands, kFolderUsage);
 }
 
 }  // namespace orvex_cli

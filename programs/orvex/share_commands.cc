@@ -139,29 +139,15 @@ int Remove(const Args& args) {
   return kExitOk;
 }
 
-struct Subcommand {
-  const char* name;
-  int (*run)(const Args& args);
-};
-
-const Subcommand kSubcommands[] = {
-    {"add", Add},
-    {"list", List},
-    {"remove", Remove},
-};
-
 }  // namespace
 
 int RunShareCommand(const Args& args) {
-  if (args.empty()) throw UsageError("missing share subcommand", kShareUsage);
-  if (args[0] == "--help") {
-    std::cout << kShareUsage;
-    return kExitOk;
-  }
-  for (const Subcommand& sub : kSubcommands) {
-    if (args[0] == sub.name) return sub.run(Args(args.begin() + 1, args.end()));
-  }
-  throw UsageError("unknown share subcommand " + args[0], kShareUsage);
+  static const std::vector<Subcommand> kSubcommands = {
+      {"add", Add},
+      {"list", List},
+      {"remove", Remove},
+  };
+  return RunSubcommand(args, "share", kSubcommands, kShareUsage);
 }
 
 }  // namespace orvex_cli

@@ -99,16 +99,14 @@ void ForEachDescendant(OPNode& node, Fn f) {
   }
 }
 
-// Sets the new op's kind, folds it against every pending op of the node by
-// the row's rules, and appends it unless it was absorbed.
-template <typename AppendFn>
-void FoldSimple(OPNode& node, const std::shared_ptr<OP>& op, FileIndexOP kind,
-                const RuleRow& rules, AppendFn append) {
-  op->kind = kind;
+// Sets the new op's kind and folds it against every pending op of the node
+// by the row's rules; true when it was not absorbed and is to be appended.
+bool FoldSimple(OPNode& node, OP& op, FileIndexOP kind, const RuleRow& rules) {
+  op.kind = kind;
   ForEachPending(node, [&](OP& e) {
-    if (IsMergeable(e.kind)) ApplyRule(rules[e.kind - OP_DELETE], *op, e);
+    if (IsMergeable(e.kind)) ApplyRule(rules[e.kind - OP_DELETE], op, e);
   });
-  if (op->kind != OP_NONE) append(node, op);
+  return op.kind != OP_NONE;
 }
 
 // Clears in_flight on every way out of InsertEvent.
@@ -134,16 +132,18 @@ void OPTree::Insert(const Fields& ev, const PathKeys& keys) {
   // several handlers on it, which can revive or absorb it in turn.
   auto op = std::make_shared<OP>(node.shared_from_this(), OP_NONE, std::string(), Json::Value());
   InFlight in_flight(in_flight_, op.get());
-  auto append = [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); };
+  auto fold_simple = [&](FileIndexOP kind, const RuleRow& rules) {
+    if (FoldSimple(node, *op, kind, rules)) Append(node, op);
+  };
   const uint32_t mask = ev.event;
   if (mask & EVENT_CREATE) {
-    ev.is_dir ? FoldReindex(node, op) : FoldSimple(node, op, OP_UPSERT, kCreateRules, append);
+    ev.is_dir ? FoldReindex(node, op) : fold_simple(OP_UPSERT, kCreateRules);
   }
-  if (mask & EVENT_ATTR) FoldSimple(node, op, OP_ATTR, kAttrRules, append);
-  if (mask & EVENT_MODIFY) FoldSimple(node, op, OP_UPSERT, kModifyRules, append);
+  if (mask & EVENT_ATTR) fold_simple(OP_ATTR, kAttrRules);
+  if (mask & EVENT_MODIFY) fold_simple(OP_UPSERT, kModifyRules);
   if (mask & EVENT_DELETE) {
     // A deleted directory is rescanned: the consumer drops what is gone.
-    ev.is_dir ? FoldReindex(node, op) : FoldSimple(node, op, OP_DELETE, kDeleteRules, append);
+    ev.is_dir ? FoldReindex(node, op) : fold_simple(OP_DELETE, kDeleteRules);
   }
   if (mask & EVENT_RENAME) {
     op->path = ev.path_old;
@@ -152,7 +152,7 @@ void OPTree::Insert(const Fields& ev, const PathKeys& keys) {
   if (mask & EVENT_REINDEX) FoldReindex(node, op);
   if (mask & EVENT_UPDATE_CFG) {
     op->data = ev.data;
-    FoldSimple(node, op, OP_UPDATE_CFG, kUpdateCfgRules, append);
+    fold_simple(OP_UPDATE_CFG, kUpdateCfgRules);
   }
   if (mask & EVENT_QUEUE_CRASHED) crashed_ = true;
 }
@@ -160,28 +160,23 @@ void OPTree::Insert(const Fields& ev, const PathKeys& keys) {
 template void OPTree::Insert<EventFields>(const EventFields& ev, const PathKeys& keys);
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  FoldSimple(*node, op, OP_UPSERT, kCreateRules,
-             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
+  if (FoldSimple(*node, *op, OP_UPSERT, kCreateRules)) Append(*node, op);
 }
 
 void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  FoldSimple(*node, op, OP_UPSERT, kModifyRules,
-             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
+  if (FoldSimple(*node, *op, OP_UPSERT, kModifyRules)) Append(*node, op);
 }
 
 void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  FoldSimple(*node, op, OP_ATTR, kAttrRules,
-             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
+  if (FoldSimple(*node, *op, OP_ATTR, kAttrRules)) Append(*node, op);
 }
 
 void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  FoldSimple(*node, op, OP_DELETE, kDeleteRules,
-             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
+  if (FoldSimple(*node, *op, OP_DELETE, kDeleteRules)) Append(*node, op);
 }
 
 void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  FoldSimple(*node, op, OP_UPDATE_CFG, kUpdateCfgRules,
-             [this](OPNode& n, const std::shared_ptr<OP>& o) { Append(n, o); });
+  if (FoldSimple(*node, *op, OP_UPDATE_CFG, kUpdateCfgRules)) Append(*node, op);
 }
 
 void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
