@@ -75,18 +75,18 @@ std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
 OPNode* OPTree::NodeOf(const std::string& path) { return NodeOf(path, NodeIndex::KeysOf(path)); }
 
 OPNode* OPTree::NodeOf(const std::string& path, const PathKeys& keys) {
-  if (!keys.canonical) return WalkPath(path);
+  if (!keys.canonical) return WalkPath(path, false);
   NodeIndex& index = root_->index();
   if (OPNode* known = index.FindPath(keys.key, path)) return known;
   // Every node of the tree is in the index, so a directory found there with
   // the path missing is a directory without that entry yet.
   const std::string_view dir(path.data(), keys.name_start - 1);
   OPNode* parent = dir.empty() ? root_.get() : index.FindPath(keys.dir_key, dir);
-  if (parent == nullptr) return WalkPath(path);
+  if (parent == nullptr) return WalkPath(path, true);
   return parent->AddChild(std::string_view(path).substr(keys.name_start), keys.key);
 }
 
-OPNode* OPTree::WalkPath(const std::string& path) {
+OPNode* OPTree::WalkPath(const std::string& path, bool canonical) {
   // Walks the non-empty components from the root, creating nodes. The node
   // reached matches the path byte for byte only when the path is canonical:
   // absolute, with no empty component and no trailing slash.
@@ -102,9 +102,7 @@ OPNode* OPTree::WalkPath(const std::string& path) {
     }
     pos = next + 1;
   }
-  if (!NodeIndex::KeysOf(path).canonical) {
-    throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
-  }
+  if (!canonical) throw Error(kErrorInternal, "GetNodeByPath failed, path=" + path);
   return node.get();
 }
 

@@ -94,8 +94,9 @@ class ORVEX_EXPORT OPTree {
   // name in a directory seen before, costs one probe of the node index.
   OPNode* NodeOf(const std::string& path, const PathKeys& keys);
   OPNode* NodeOf(const std::string& path);
-  // GetNodeByPath's walk from the root, component by component.
-  OPNode* WalkPath(const std::string& path);
+  // GetNodeByPath's walk from the root, component by component, creating
+  // nodes; throws Error 9999 at the end unless the path is canonical.
+  OPNode* WalkPath(const std::string& path, bool canonical);
   // The handlers' work, without copying shared references on the way; the
   // public handlers wrap these.
   void FoldReindex(OPNode& node, const std::shared_ptr<OP>& op);
