@@ -73,13 +73,9 @@ const std::string& Folder::CachedFullPath() const {
 }
 
 Json::Value Folder::GetData() const {
-  Json::Value data(Json::objectValue);
+  Json::Value data = GetIndexCfg();
   data[kPathKey] = path_;
   data[kNameKey] = name_;
-  data[kDocumentKey] = document_;
-  data[kAudioKey] = audio_;
-  data[kVideoKey] = video_;
-  data[kPhotoKey] = photo_;
   data[kPausedKey] = paused_;
   data[kVolumeToBeCleanKey] = volume_to_be_clean_;
   return data;
