@@ -1,11 +1,12 @@
-// Timing helpers shared by the benchmark programs. Figures are compared as
-// ratios within one run, so each keeps the fastest of a few runs: the one
-// least disturbed by the rest of a shared machine.
+// Timing and reporting helpers shared by the benchmark programs. Figures are
+// compared as ratios within one run, so each keeps the fastest of a few runs:
+// the one least disturbed by the rest of a shared machine.
 #ifndef ORVEX_BENCH_BENCH_TIMING_H_
 #define ORVEX_BENCH_BENCH_TIMING_H_
 
 #include <algorithm>
 #include <chrono>
+#include <cstdio>
 #include <cstddef>
 #include <functional>
 #include <vector>
@@ -17,6 +18,21 @@ using Clock = std::chrono::steady_clock;
 
 inline double Seconds(Clock::time_point start) {
   return std::chrono::duration<double>(Clock::now() - start).count();
+}
+
+// The seconds work() takes.
+inline double SecondsOf(const std::function<void()>& work) {
+  const Clock::time_point start = Clock::now();
+  work();
+  return Seconds(start);
+}
+
+// Prints "<what>: <value><unit> (target <= <target>) PASS|FAIL"; true on PASS.
+inline bool Report(const char* what, double value, const char* unit, double target) {
+  const bool pass = value <= target;
+  std::printf("%s: %.3f%s (target <= %g) %s\n", what, value, unit, target, pass ? "PASS" : "FAIL");
+  std::fflush(stdout);
+  return pass;
 }
 
 // The fastest of `repeats` runs of run(), each returning its own seconds.

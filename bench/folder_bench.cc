@@ -29,13 +29,14 @@
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/log.h"
 #include "orvex/queue/queue_mgr.h"
+#include "bench_timing.h"
 
 namespace {
 
 using orvex::fileindex::Folder;
 using orvex::fileindex::FolderMgr;
 using orvex::fileindex::QueueMgr;
-using Clock = std::chrono::steady_clock;
+using orvex::bench::SecondsOf;
 
 constexpr int kGroups = 10;             // top-level folders
 constexpr int kPerGroup = 99;           // subfolders of each
@@ -43,12 +44,6 @@ constexpr int kBusyFolders = 10;        // subfolders the queue's events lie bel
 constexpr int kLookups = 200000;        // GetMostSuitableCfg calls timed
 constexpr int kPlainListRepeats = 20;   // lists without status timed
 constexpr char kShare[] = "bench";
-
-double Seconds(const std::function<void()>& work) {
-  const auto start = Clock::now();
-  work();
-  return std::chrono::duration<double>(Clock::now() - start).count();
-}
 
 // A temporary ORVEX_ROOT holding the share, its folders, the folder file, a
 // status file and the share's queue; removed at exit.
@@ -83,7 +78,8 @@ class BenchRoot {
     std::shuffle(shuffled.begin(), shuffled.end(), std::mt19937(42));
     Json::Value list(Json::arrayValue);
     for (const Json::Value& folder : shuffled) {
-      std::filesystem::create_directories(share_root_ + folder["path"].asString().substr(1 + std::string(kShare).size()));
+      const std::string inside = folder["path"].asString().substr(1 + std::string(kShare).size());
+      std::filesystem::create_directories(share_root_ + inside);
       list.append(folder);
     }
     Write("var/packages/Orvex/etc/fileindex.folders", orvex::toString(list));
@@ -132,10 +128,12 @@ void BenchGoverningFolder(const BenchRoot& root) {
     probes.push_back(root.share_root() + "/unindexed/" + std::to_string(i) + ".mp3");
   }
   const FolderMgr mgr;
-  const double first = Seconds([&] { mgr.GetMostSuitableCfg(probes[0]); });
+  const double first = SecondsOf([&] { mgr.GetMostSuitableCfg(probes[0]); });
   size_t found = 0;
-  const double loop = Seconds([&] {
-    for (int i = 0; i < kLookups; ++i) found += mgr.GetMostSuitableCfg(probes[i % probes.size()]) ? 1 : 0;
+  const double loop = SecondsOf([&] {
+    for (int i = 0; i < kLookups; ++i) {
+      found += mgr.GetMostSuitableCfg(probes[i % probes.size()]) ? 1 : 0;
+    }
   });
   std::printf("GetMostSuitableCfg, %zu folders: first call %.1f ms (fills the full-path caches), "
               "then %.0f ns per call (%d calls, %zu governed)\n",
@@ -158,7 +156,7 @@ size_t ListAll(const Json::Value& additional, std::vector<std::string>* texts = 
 
 void BenchList(const BenchRoot& root, int queue_lines) {
   size_t listed = 0;
-  const double plain = Seconds([&] {
+  const double plain = SecondsOf([&] {
     for (int i = 0; i < kPlainListRepeats; ++i) listed = ListAll(Json::Value(Json::arrayValue));
   });
   std::printf("FolderList, %zu folders sorted by path, no status: %.1f ms per list "
@@ -168,7 +166,7 @@ void BenchList(const BenchRoot& root, int queue_lines) {
   std::vector<std::string> texts;
   Json::Value status(Json::arrayValue);
   status.append("status");
-  const double with_status = Seconds([&] { ListAll(status, &texts); });
+  const double with_status = SecondsOf([&] { ListAll(status, &texts); });
   const long processing = std::count(texts.begin(), texts.end(), "processing");
   const long finished = std::count(texts.begin(), texts.end(), "finished");
   std::printf("FolderList, %zu folders sorted by path, with status, %d-line queue: %.2f s "
@@ -181,8 +179,9 @@ void BenchList(const BenchRoot& root, int queue_lines) {
   double scan = 1e9;
   QueueMgr queue(root.share_root() + "/@eaDir/@fileindex/queue");
   for (int i = 0; i < 3; ++i) {
-    load = std::min(load, Seconds([] { FolderMgr mgr; }));
-    scan = std::min(scan, Seconds([&] { queue.IsFullPathProcessing(root.share_root() + "/Group9"); }));
+    load = std::min(load, SecondsOf([] { FolderMgr mgr; }));
+    const std::string asked = root.share_root() + "/Group9";
+    scan = std::min(scan, SecondsOf([&] { queue.IsFullPathProcessing(asked); }));
   }
   std::printf("  where a finished folder's status goes: folder file load %.2f ms (once per "
               "queue question), full scan of the queue %.1f ms (%.2f us per line)\n",

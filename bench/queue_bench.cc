@@ -41,6 +41,7 @@ using orvex::fileindex::LineReader;
 using orvex::fileindex::OPTree;
 using orvex::bench::Clock;
 using orvex::bench::Fastest;
+using orvex::bench::Report;
 using orvex::bench::Seconds;
 
 constexpr size_t kDefaultLines = 1000000;
@@ -121,13 +122,6 @@ long long PeakResidentBytes() {
     if (line.compare(0, 6, "VmHWM:") == 0) return std::atoll(line.c_str() + 6) * 1024;
   }
   return -1;
-}
-
-bool Report(const char* what, double value, const char* unit, double target) {
-  const bool pass = value <= target;
-  std::printf("%s: %.2f%s (target <= %g) %s\n", what, value, unit, target, pass ? "PASS" : "FAIL");
-  std::fflush(stdout);
-  return pass;
 }
 
 void WriteQueue(const std::string& path, size_t lines, double dir_events) {
