@@ -2,8 +2,8 @@
 // directory hierarchy they live in. A node is one path component; an op hangs
 // on the node of its path and is also listed, in arrival order, in its
 // OPTree. Both are owned through std::shared_ptr and link to each other both
-// ways; the OPTree that made them cuts those links when it is dropped, so
-// nodes are meant to live in a tree. One thread at a time.
+// ways; the OPTree that made them cuts those links when it is dropped, and
+// nodes made outside a tree need OPNode::ReleaseTree. One thread at a time.
 #ifndef ORVEX_QUEUE_OP_H_
 #define ORVEX_QUEUE_OP_H_
 
