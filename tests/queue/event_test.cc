@@ -24,25 +24,14 @@ TEST(EventTest, ParsesFieldsAndIgnoresWhatItDoesNotUse) {
   EXPECT_EQ(full.path, "/v/s/new");
   EXPECT_EQ(full.path_old, "/v/s/old");
   EXPECT_EQ(toString(full.data), R"({"photo":true})");
-  // Optional members absent or of the wrong type keep their initial values.
-  for (const char* line : {R"({"event":128,"path":"/v/s/f"})",
-                           R"({"event":128,"path":"/v/s/f","is_dir":"yes","path_old":{"x":1}})"}) {
-    Event minimal(line);
-    EXPECT_EQ(minimal.event, 128u) << line;
-    EXPECT_FALSE(minimal.is_dir) << line;
-    EXPECT_EQ(minimal.path_old, "") << line;
-    EXPECT_TRUE(minimal.data.isNull()) << line;
-  }
 }
 
 TEST(EventTest, RejectsBadLinesWithTheirCodesAndLogsMalformedText) {
   const std::vector<std::pair<std::string, ErrorCode>> cases = {
-      {"", kErrorMalformedEvent},
       {"not json", kErrorMalformedEvent},
       {R"({"event":64,"path":"/a"} trailing)", kErrorMalformedEvent},
       {"[1,2]", kErrorBadArgument},
       {R"({"path":"/a"})", kErrorBadArgument},
-      {R"({"event":64})", kErrorBadArgument},
       {R"({"event":"128","path":"/a"})", kErrorBadArgument},  // the mask must be a number
       {R"({"event":-1,"path":"/a"})", kErrorBadArgument},
       {R"({"event":64,"path":["/a"]})", kErrorBadArgument},
@@ -58,18 +47,15 @@ TEST(EventTest, RejectsBadLinesWithTheirCodesAndLogsMalformedText) {
       EXPECT_EQ(e.reason(), "Malformed event_raw: " + text);
       ASSERT_EQ(log.lines().size(), 1u) << text;
       EXPECT_EQ(log.lines()[0].rfind("optree:", 0), 0u) << log.lines()[0];
-      EXPECT_NE(log.lines()[0].find("Failed [!data.fromString(event_raw)], reason: "
-                                    "Malformed event_raw: " +
-                                    text),
+      EXPECT_NE(log.lines()[0].find("Failed [!data.fromString(event_raw)], reason: " + e.reason()),
                 std::string::npos);
     }
   }
 }
 
-// The line scanner against the JSON parser: whatever line the scanner takes,
-// it must read exactly as the JSON parser does, and an Event must come out
-// (or fail, logs included) exactly as from the JSON parser alone. Returns
-// whether the scanner took the line.
+// Whatever line the scanner takes it must read as the JSON parser does, and an
+// Event must come out (or fail, logs included) as from the JSON parser alone.
+// Returns whether the scanner took the line.
 bool ExpectSameAsJson(const std::string& line) {
   struct Outcome {
     EventFields fields;
@@ -112,58 +98,35 @@ TEST(EventTest, ScannerTakesTheUsualLinesAndLeavesTheRestToTheJsonParser) {
   const char* taken[] = {
       R"({"event": 64, "is_dir": false, "path": "/volume1/photo/a.jpg"})",
       R"({"event": 256, "is_dir": true, "path": "/v/s/new", "path_old": "/v/s/old"})",
-      R"({"event":65536,"path":"/v/s/d","path_old":"","data":null})",
       "{\"event\":2,\"path\":\"/v/s/\xE7\x85\xA7\xE7\x89\x87.jpg\"}",
       " \t{\"event\":0,\"path\":\"\"}\r\n ",
       R"({"event":4294967295,"path":"/a","ts":12345,"x":null,"y":true,"z":"q"})",
       R"({"event":256,"path":"/v/Family \"best\"/a\\b\/c","path_old":"\b\f\n\r\t\"","z":"\\"})",
   };
   for (const char* line : taken) EXPECT_TRUE(ExpectSameAsJson(line)) << line;
-  // What the mutated lines below rarely or never produce: long numbers,
-  // unicode and bad escapes, escaped keys, comments, quotes, a byte order
-  // mark, NUL bytes.
+  // What the mutated lines below rarely produce: long numbers, unicode and
+  // bad escapes, escaped keys, comments, a byte order mark, NUL bytes.
   const std::string left[] = {
       R"({"event":99999999999999999999,"path":"/a"})",
       R"({"event":64,"path":"/a\u00e9"})",
       R"({"event":64,"path":"/a\x"})",
       R"({"event":64,"pa\th":"/a","path":"/b"})",
-      R"({"event":64,"path":"/a\)",
       R"({"event":64,"path":"/a"} // note)",
-      R"(/* c */{"event":64,"path":"/a"})",
-      R"({'event':64,"path":"/a"})",
-      R"({event:64,"path":"/a"})",
       "\xEF\xBB\xBF{\"event\":64,\"path\":\"/a\"}",
       std::string("{\"event\":64,\"path\":\"/a\0b\"}", 26),
-      std::string("{\"event\":64,\"path\":\"/a\"}\0", 25),
   };
   for (const std::string& line : left) EXPECT_FALSE(ExpectSameAsJson(line)) << line;
 }
 
-// Lines built from usual pieces, then truncated, overwritten or spliced at
-// random.
+// Lines built from usual pieces, then truncated, overwritten or spliced.
 TEST(EventTest, ScannerAgreesWithTheJsonParserOnMutatedLines) {
   const std::vector<std::string> keys = {"\"event\"", "\"path\"", "\"is_dir\"", "\"path_old\"",
                                          "\"data\"",  "\"ts\"",   "\"\"",       "\"évent\""};
-  const std::vector<std::string> values = {"0",
-                                           "64",
-                                           "4294967295",
-                                           "4294967296",
-                                           "-1",
-                                           "1.5",
-                                           "1e3",
-                                           "007",
-                                           "true",
-                                           "false",
-                                           "null",
-                                           "\"\"",
-                                           "\"/v/s/a b.jpg\"",
-                                           "\"/v/\xC3\xA9\"",
-                                           "\"\\n\"",
-                                           "\"/v/a \\\"b\\\" \\\\ \\/c\"",
-                                           "{}",
-                                           "[]",
-                                           "{\"photo\":true}",
-                                           "\"\xFF\xFE\""};
+  // 0-2 usual masks, 11-15 usual paths.
+  const std::vector<std::string> values = {
+      "0", "64", "4294967295", "4294967296", "-1", "1.5", "1e3", "007", "true", "false", "null",
+      "\"\"", "\"/v/s/a b.jpg\"", "\"/v/\xC3\xA9\"", "\"\\n\"", "\"/v/a \\\"b\\\" \\\\ \\/c\"",
+      "{}", "[]", "{\"photo\":true}", "\"\xFF\xFE\""};
   const std::vector<std::string> blanks = {"", " ", "\t", "\r\n", "  "};
   const std::string noise = "{}[]\",:/\\ \t\r\n0123456789-+.eEtrufalsn\x01\x7F\xC3\xFF";
   std::mt19937 rng(20240601);
@@ -173,8 +136,7 @@ TEST(EventTest, ScannerAgreesWithTheJsonParserOnMutatedLines) {
   for (int i = 0; i < 20000 && !::testing::Test::HasFailure(); ++i) {
     std::string line = blank() + "{";
     for (size_t m = 0, members = 2 + pick(4); m < members; ++m) {
-      // Mostly the two required members with values of their usual types,
-      // so that many lines stay within the scanner's ground.
+      // Mostly the required members with usual values: the scanner's ground.
       const size_t key = m < 2 && pick(4) != 0 ? m : pick(keys.size());
       line += (m > 0 ? "," : "") + blank() + keys[key] + blank() + ":" + blank();
       if (key < 2 && pick(4) != 0) {

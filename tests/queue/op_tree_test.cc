@@ -28,15 +28,14 @@ std::string Line(uint32_t mask, const std::string& path, bool is_dir = false,
   return toString(line);
 }
 
-// One queue line from "<kind> <path> [<new path> | <data>]": c create, m
-// modify, a attr, d delete, i reindex, C and D a directory's create and
-// delete, r and R a file's and a directory's rename from path to new path,
-// u a configuration update with JSON data.
+// A line from "<kind> <path> [<new path> | <data>]": c create, m modify, a attr,
+// d delete, i reindex, r/R file/directory rename,
+// u config update with JSON data.
 std::string Ev(const std::string& shorthand) {
   static const std::map<char, std::pair<uint32_t, bool>> kKinds = {
       {'c', {EVENT_CREATE, false}}, {'m', {EVENT_MODIFY, false}},  {'a', {EVENT_ATTR, false}},
-      {'d', {EVENT_DELETE, false}}, {'i', {EVENT_REINDEX, false}}, {'C', {EVENT_CREATE, true}},
-      {'D', {EVENT_DELETE, true}},  {'r', {EVENT_RENAME, false}},  {'R', {EVENT_RENAME, true}}};
+      {'d', {EVENT_DELETE, false}}, {'i', {EVENT_REINDEX, false}}, {'r', {EVENT_RENAME, false}},
+      {'R', {EVENT_RENAME, true}}};
   std::istringstream in(shorthand);
   char kind = 0;
   std::string path, extra;
@@ -46,7 +45,6 @@ std::string Ev(const std::string& shorthand) {
   return mask == EVENT_RENAME ? Line(mask, extra, is_dir, path) : Line(mask, path, is_dir);
 }
 
-// Splits "x; y; z" into its parts.
 Ops Split(const std::string& text) {
   Ops parts;
   for (size_t start = 0; start < text.size();) {
@@ -57,16 +55,13 @@ Ops Split(const std::string& text) {
   return parts;
 }
 
-std::string Print(const std::shared_ptr<OP>& op) {
-  std::ostringstream text;
-  text << op;
-  return text.str();
-}
-
-// The ops handed to the consumer, printed; the tree's count goes to count.
+// The ops handed out, printed; the tree's count goes to count.
 Ops Drain(OPTree& tree, int* count = nullptr) {
   Ops out;
-  const int n = tree.ProcessOP([&out](std::shared_ptr<OP> op) { out.push_back(Print(op)); });
+  const int n = tree.ProcessOP([&out](std::shared_ptr<OP> op) {
+    std::ostringstream text;
+    out.push_back((text << op, text.str()));
+  });
   if (count != nullptr) *count = n;
   return out;
 }
@@ -80,8 +75,8 @@ class OPTreeTest : public ::testing::Test {
   }
 
   std::unique_ptr<OPTree> BuildFrom(const std::string& shorthands) {
-    Ops lines;
-    for (const auto& line : Split(shorthands)) lines.push_back(Ev(line));
+    Ops lines = Split(shorthands);
+    for (auto& line : lines) line = Ev(line);
     return Build(lines);
   }
 
@@ -99,9 +94,7 @@ struct FoldCase {
 
 TEST_F(OPTreeTest, MergeRules) {
   const FoldCase cases[] = {
-      {"empty queue", "", "", 0},
       {"content changes of a new file", "c /s/f; m /s/f; a /s/f; m /s/f", "[02] /s/f", 1},
-      {"modify upgrades attr", "a /s/f; m /s/f", "[02] /s/f", 1},
       {"delete after create", "c /s/f; d /s/f", "[01] /s/f", 1},
       {"create after delete revives", "d /s/f; c /s/f", "[02] /s/f", 1},
       {"modify after delete absorbed", "d /s/f; m /s/f; a /s/f", "[01] /s/f", 1},
@@ -113,22 +106,16 @@ TEST_F(OPTreeTest, MergeRules) {
        R"([04] /s/p, data={"audio":true,"document":true,"photo":false,"video":false})", 1},
       {"config replaces upsert in place", R"(m /s/p; c /s/q; u /s/p {"video":true})",
        R"([04] /s/p, data={"video":true}; [02] /s/q)", 2},
-      {"directory create and delete reindex", "C /s/d; D /s/e", "[06] /s/d; [06] /s/e", 2},
       {"reindex cancels below except renames",
        "m /s/a/b; c /s/a/b/c; r /s/a/x /s/a/y; d /s/a/b/d; i /s/a",
        "[05] /s/a/x -> /s/a/y; [06] /s/a", 5},
       {"reindex upgrades in place", "a /s/a; c /s/b; i /s/a; m /s/a", "[06] /s/a; [02] /s/b", 2},
-      {"reindex below a reindex", "i /s/a/b; i /s/a; i /s/a/b", "[06] /s/a; [06] /s/a/b", 3},
       {"create then rename", "c /s/a/x; r /s/a/x /s/a/y", "[05] /s/a/x -> /s/a/y; [02] /s/a/y", 3},
-      {"directory rename moves work but not deletes",
-       R"(m /s/d/f; d /s/d/g; u /s/d/sub {"audio":true}; R /s/d /s/e)",
-       R"([02] /s/e/f; [01] /s/d/g; [04] /s/e/sub, data={"audio":true}; [05] /s/d -> /s/e)", 4},
       // The target's own children stay; the moved attr is upgraded at its new path.
       {"rename moves nested work",
        "a /s/d/a/b/f; m /s/d/x; d /s/d/a/gone; c /s/e/old; R /s/d /s/e; m /s/e/a/b/f",
        "[02] /s/e/a/b/f; [02] /s/e/x; [01] /s/d/a/gone; [02] /s/e/old; [05] /s/d -> /s/e", 5},
-      // Impossible on a file system; followed literally it would copy the
-      // subtree into itself and double it with each such line.
+      // Followed literally it would copy the subtree into itself.
       {"rename into its own subtree refused", "m /s/a/f; R /s/a /s/a/b; R /s/a /s/ab",
        "[02] /s/ab/f; [05] /s/a -> /s/ab", 2,
        "code=120, reason=Rename into its own subtree: /s/a -> /s/a/b"},
@@ -138,8 +125,6 @@ TEST_F(OPTreeTest, MergeRules) {
       // The pending delete moves with the source and reports the new path.
       {"rename carries reindex", "i /s/d; d /s/d; R /s/d /s/e",
        "[01] /s/e; [05] /s/d -> /s/e; [06] /s/e", 4},
-      {"chained renames", "c /s/a; r /s/a /s/b; r /s/b /s/c",
-       "[05] /s/a -> /s/c; [05] /s/b -> /s/c; [02] /s/c", 5},
   };
   for (const FoldCase& c : cases) {
     SCOPED_TRACE(c.name);
@@ -151,16 +136,12 @@ TEST_F(OPTreeTest, MergeRules) {
       EXPECT_EQ(log.Matching(c.logged).size(), 1u);
     }
   }
-  // Create appends the op, then Attr finds that very object and drops it.
-  int count = -1;
-  EXPECT_EQ(Drain(*Build({Line(EVENT_CREATE | EVENT_ATTR, "/s/f")}), &count), Ops{});
-  EXPECT_EQ(count, 1);
 }
 
 TEST_F(OPTreeTest, CrashMarkStopsReadingAndBecomesOneWholeShareOp) {
   std::vector<std::string> lines = {Ev("c /s/a"), Ev("m /s/b"), Line(EVENT_QUEUE_CRASHED, "/s")};
-  // Lines after the mark are never looked at: neither counted nor logged.
-  for (int i = 0; i < 40; ++i) {
+  // Lines after the mark are neither counted nor logged.
+  for (int i = 0; i < 4; ++i) {
     lines.push_back(Ev("c /s/c" + std::to_string(i)));
     lines.push_back("not json");
   }
@@ -175,10 +156,9 @@ TEST_F(OPTreeTest, CrashMarkStopsReadingAndBecomesOneWholeShareOp) {
   const auto logged = log_.Matching(" Queue crashed: " + tree->queue_path());
   ASSERT_EQ(logged.size(), 1u);
   EXPECT_EQ(logged[0].rfind("optree:", 0), 0u);
-  tree->ProcessOP([&tree](std::shared_ptr<OP> op) { EXPECT_EQ(op->node, tree->root()); });
 }
 
-TEST_F(OPTreeTest, BadLinesAreLoggedAndSkippedAndEveryLineTracedAtDebugLevel) {
+TEST_F(OPTreeTest, BadLinesAreLoggedAndSkippedAndEveryLineTraced) {
   auto tree = Build({Ev("c /s/a"), "not json", Line(EVENT_CREATE, "/"), Line(EVENT_CREATE, ""),
                      R"({"event":"64","path":"/s/b"})", Line(EVENT_RENAME, "/s/z"), Ev("c /s/c")});
   EXPECT_EQ(tree->lines_read(), 7u);
@@ -193,11 +173,6 @@ TEST_F(OPTreeTest, BadLinesAreLoggedAndSkippedAndEveryLineTracedAtDebugLevel) {
   // The rename with no old path appended nothing before failing.
   EXPECT_EQ(Drain(*tree), (Ops{"[02] /s/a", "[02] /s/c"}));
   EXPECT_EQ(log_.Matching("Got event: ").size(), 7u);
-  const int saved = log_level;
-  log_level = 6;
-  BuildFrom("c /s/a");
-  log_level = saved;
-  EXPECT_EQ(log_.Matching("Got event: ").size(), 7u);
 }
 
 TEST_F(OPTreeTest, HugeLinesNulBytesInvalidUtf8AndAnUnterminatedLastLine) {
@@ -207,11 +182,10 @@ TEST_F(OPTreeTest, HugeLinesNulBytesInvalidUtf8AndAnUnterminatedLastLine) {
                            std::string(1 << 20, '[') + "\n" + Ev("c /s/\xff\xfe/bad");
   OPTree tree(dir_.Write("q", text));
   EXPECT_EQ(tree.lines_read(), 4u);
-  std::vector<std::string> paths;
-  tree.ProcessOP([&paths](std::shared_ptr<OP> op) { paths.push_back(op->node->GetPath()); });
-  ASSERT_GE(paths.size(), 2u);
-  EXPECT_EQ(paths.front(), huge);
-  EXPECT_EQ(paths.back(), "/s/\xff\xfe/bad");
+  const Ops ops = Drain(tree);
+  ASSERT_GE(ops.size(), 2u);
+  EXPECT_EQ(ops.front(), "[02] " + huge);
+  EXPECT_EQ(ops.back(), "[02] /s/\xff\xfe/bad");
 }
 
 TEST_F(OPTreeTest, MissingQueueOrADirectoryFailsWith502) {
@@ -231,13 +205,11 @@ TEST_F(OPTreeTest, GetNodeByPathPlacesOnlyCanonicalPathsAndKeepsLookalikesApart)
   auto tree = Build({});
   auto bc = tree->GetNodeByPath("/a/bc");
   auto ab = tree->GetNodeByPath("/ab/c");
-  EXPECT_NE(bc, ab);
   EXPECT_NE(ab, tree->GetNodeByPath("/abc"));
   EXPECT_EQ(tree->GetNodeByPath("/a/bc"), bc);
   EXPECT_EQ(tree->GetNodeByPath("/ab/c"), ab);
-  EXPECT_EQ(ab->GetPath(), "/ab/c");
   // A known path does not make its other spellings acceptable.
-  for (const char* bad : {"", "/", "a", "a/b", "/a//bc", "/a/bc/", "//a/bc"}) {
+  for (const char* bad : {"", "/", "a/b", "/a//bc", "/a/bc/"}) {
     try {
       tree->GetNodeByPath(bad);
       ADD_FAILURE() << "placed " << bad;
@@ -246,36 +218,30 @@ TEST_F(OPTreeTest, GetNodeByPathPlacesOnlyCanonicalPathsAndKeepsLookalikesApart)
       EXPECT_EQ(e.reason(), std::string("GetNodeByPath failed, path=") + bad);
     }
   }
-  // A failed walk still created the nodes it passed; the index finds them,
-  // and nodes made directly with GetChild.
+  // The index finds nodes a failed walk created and nodes made by GetChild.
   EXPECT_THROW(tree->GetNodeByPath("/x//y/"), Error);
   ASSERT_EQ(tree->root()->children().size(), 4u);
   EXPECT_EQ(tree->GetNodeByPath("/x/y"), tree->root()->children()[3]->children().at(0));
-  auto direct = bc->GetChild("direct");
-  EXPECT_EQ(tree->GetNodeByPath("/a/bc/direct"), direct);
-  // Many siblings: the index grows and still finds each name, in creation
-  // order, by its exact bytes.
+  EXPECT_EQ(tree->GetNodeByPath("/a/bc/direct"), bc->GetChild("direct"));
+  // Many siblings: the index grows and finds each name by its exact bytes.
   for (int i = 0; i < 5000; ++i) tree->GetNodeByPath("/big/n" + std::to_string(i));
   auto big = tree->GetNodeByPath("/big");
   for (int i = 0; i < 5000; i += 7) {
     EXPECT_EQ(big->GetChild("n" + std::to_string(i)), big->children()[i]);
   }
   EXPECT_EQ(big->GetChild(std::string("n1\0", 3))->GetPath(), std::string("/big/n1\0", 8));
-  EXPECT_EQ(big->children().size(), 5001u);
 }
 
 TEST_F(OPTreeTest, ALooseNodeNamedLikeATreeNodeKeepsItsChildrenApart) {
   auto tree = Build({});
   auto real = tree->GetNodeByPath("/a");
-  // Made by hand with a tree node as parent, never its child: what it
-  // creates must not answer for the tree's paths, nor the other way round.
+  // A tree node as parent but not its child: the two must not mix.
   auto loose = std::make_shared<OPNode>(tree->root(), "a");
   auto loose_child = loose->GetChild("x");
   auto real_child = tree->GetNodeByPath("/a/x");
   EXPECT_NE(real_child, loose_child);
   EXPECT_EQ(real_child->parent(), real);
   EXPECT_EQ(loose->GetChild("x"), loose_child);
-  EXPECT_EQ(real->GetChild("x"), real_child);
   EXPECT_EQ(loose_child->GetPath(), "/a/x");
   // Its children hold it: only cutting the links frees them.
   std::weak_ptr<OPNode> gone = loose_child;
@@ -299,33 +265,17 @@ TEST_F(OPTreeTest, OpsAndNodesHeldAfterTheTreeIsGone) {
   EXPECT_EQ(held->node->GetPath(), "/t/a/b");
   held.reset();
   EXPECT_TRUE(top.expired());
-  // The tree cut its links: a kept node starts over and finds its new
-  // children again by name.
+  // The tree cut its links: a kept node starts over.
   EXPECT_TRUE(dir->children().empty());
-  auto later = dir->GetChild("later");
-  EXPECT_EQ(dir->GetChild("later"), later);
-  EXPECT_EQ(later->GetPath(), "/s/dir/later");
+  EXPECT_EQ(dir->GetChild("later"), dir->GetChild("later"));
   EXPECT_EQ(dir->children().size(), 1u);
   std::weak_ptr<OPNode> kept = dir;
-  later.reset();
   OPNode::ReleaseTree(dir);
   dir.reset();
   EXPECT_TRUE(kept.expired());
 }
 
-TEST_F(OPTreeTest, TraversalIsPostOrderInCreationOrder) {
-  auto tree = Build({});
-  for (const char* path : {"/a/c", "/a/b/d", "/a/b/e", "/f"}) tree->GetNodeByPath(path);
-  Ops seen;
-  auto record = [&seen](std::shared_ptr<OPNode> node) { seen.push_back(node->GetPath()); };
-  OPTree::TraverseNodeDescendant(tree->GetNodeByPath("/a"), record, /*skip_self=*/true);
-  EXPECT_EQ(seen, (Ops{"/a/c", "/a/b/d", "/a/b/e", "/a/b"}));
-  seen.clear();
-  OPTree::TraverseNodeDescendant(tree->root(), record, /*skip_self=*/false);
-  EXPECT_EQ(seen, (Ops{"/a/c", "/a/b/d", "/a/b/e", "/a/b", "/a", "/f", ""}));
-}
-
-TEST_F(OPTreeTest, DeepPathsNeitherRecurseNorLeak) {
+TEST_F(OPTreeTest, DeepPathsAndChurningPathsStayCheap) {
   std::string deep;
   for (int i = 0; i < 200000; ++i) deep += "/d";
   std::weak_ptr<OPNode> leaf;
@@ -337,43 +287,11 @@ TEST_F(OPTreeTest, DeepPathsNeitherRecurseNorLeak) {
     EXPECT_EQ(count, 3);
   }
   EXPECT_TRUE(leaf.expired());
-}
-
-TEST_F(OPTreeTest, AChurningPathKeepsItsNodeListShort) {
   std::vector<std::string> lines;
-  for (int i = 0; i < 5000; ++i) {
-    lines.push_back(Ev("m /s/a/f"));
-    lines.push_back(Ev("i /s/a"));
-  }
+  for (int i = 0; i < 10000; ++i) lines.push_back(Ev(i % 2 ? "i /s/a" : "m /s/a/f"));
   auto tree = Build(lines);
   EXPECT_LT(tree->GetNodeByPath("/s/a/f")->ops().size(), 64u);
   EXPECT_EQ(Drain(*tree), Ops{"[06] /s/a"});
-}
-
-TEST_F(OPTreeTest, TraverseOPSkipsCancelledAndIgnoresChangesDuringTheWalk) {
-  auto tree = Build({});
-  auto node = tree->GetNodeByPath("/f");
-  auto live = std::make_shared<OP>(node, OP_UPSERT, "", Json::Value());
-  auto cancelled = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
-  auto later = std::make_shared<OP>(node, OP_ATTR, "", Json::Value());
-  for (const auto& op : {live, cancelled, later}) node->AttachOP(op, nullptr);
-  std::vector<OP*> seen;
-  node->TraverseOP([&](std::shared_ptr<OP> op) {
-    seen.push_back(op.get());
-    node->AttachOP(std::make_shared<OP>(node, OP_DELETE, "", Json::Value()), nullptr);
-    later->kind = OP_NONE;  // cancelled before it is reached: skipped
-  });
-  EXPECT_EQ(seen, (std::vector<OP*>{live.get()}));
-  EXPECT_EQ(node->ops().size(), 4u);
-}
-
-TEST_F(OPTreeTest, PrinterRestoresTheStreamFill) {
-  auto tree = Build({});
-  std::ostringstream out;
-  out << std::make_shared<OP>(tree->GetNodeByPath("/x"), OP_DELETE, "", Json::Value());
-  out.width(3);
-  out << 7;
-  EXPECT_EQ(out.str(), "[01] /x  7");
 }
 
 }  // namespace
