@@ -13,8 +13,7 @@
 namespace orvex {
 namespace testing {
 
-// line with the number after its leading "<source>:" replaced by "N"; line
-// itself when it does not start that way.
+// line with the number after its leading "<source>:" replaced by "N".
 inline std::string WithoutLineNumber(const std::string& line) {
   const size_t colon = line.find(':');
   if (colon == std::string::npos) return line;
@@ -23,8 +22,7 @@ inline std::string WithoutLineNumber(const std::string& line) {
   return line.substr(0, colon + 1) + "N" + line.substr(end);
 }
 
-// The line a failed check in source writes, as WithoutLineNumber shows it
-// (without the " [err: ...]" suffix of a check that left errno set).
+// The line a failed check in source writes, as WithoutLineNumber shows it.
 inline std::string CheckLine(const std::string& source, const std::string& condition,
                              const std::string& reason) {
   return source + ":N (" + std::to_string(::getpid()) + ", " + std::to_string(::geteuid()) +
@@ -35,16 +33,13 @@ inline std::string CheckLine(const std::string& source, const std::string& condi
 // fail with EFBIG instead of raising SIGXFSZ: a full disk in miniature.
 class ScopedRlimit {
  public:
-  using Resource = decltype(RLIMIT_FSIZE);  // an enum under glibc
-  ScopedRlimit(Resource resource, rlim_t value) : resource_(resource) {
+  ScopedRlimit(decltype(RLIMIT_FSIZE) resource, rlim_t value) : resource_(resource) {
     handler_ = std::signal(SIGXFSZ, SIG_IGN);
     ::getrlimit(resource_, &saved_);
     struct rlimit lowered = saved_;
     lowered.rlim_cur = value;
     ok_ = ::setrlimit(resource_, &lowered) == 0;
   }
-  ScopedRlimit(const ScopedRlimit&) = delete;
-  ScopedRlimit& operator=(const ScopedRlimit&) = delete;
   ~ScopedRlimit() {
     ::setrlimit(resource_, &saved_);
     std::signal(SIGXFSZ, handler_);
@@ -52,7 +47,7 @@ class ScopedRlimit {
   bool ok() const { return ok_; }
 
  private:
-  Resource resource_;
+  decltype(RLIMIT_FSIZE) resource_;
   struct rlimit saved_;
   void (*handler_)(int);
   bool ok_ = false;
