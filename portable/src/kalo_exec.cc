@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "kalo/kalo_error.h"
+#include "orvex/portable/file_descriptor.h"
 
 namespace {
 
@@ -18,29 +19,17 @@ constexpr int kExecFailedStatus = 127;
 // A pipe whose write end closes at the child's exec: the child reports an
 // exec failure by writing its errno, and the parent reads end-of-file when
 // the exec succeeded.
-class ExecPipe {
- public:
+struct ExecPipe {
   ExecPipe() {
-    if (::pipe2(fds_, O_CLOEXEC) != 0) fds_[0] = fds_[1] = -1;
+    int fds[2];
+    if (::pipe2(fds, O_CLOEXEC) != 0) return;
+    read_end.reset(fds[0]);
+    write_end.reset(fds[1]);
   }
-  ExecPipe(const ExecPipe&) = delete;
-  ExecPipe& operator=(const ExecPipe&) = delete;
-  ~ExecPipe() {
-    CloseRead();
-    CloseWrite();
-  }
-  bool ok() const { return fds_[0] >= 0; }
-  int read_fd() const { return fds_[0]; }
-  int write_fd() const { return fds_[1]; }
-  void CloseRead() { Close(fds_[0]); }
-  void CloseWrite() { Close(fds_[1]); }
+  bool ok() const { return read_end.valid(); }
 
- private:
-  static void Close(int& fd) {
-    if (fd >= 0) ::close(fd);
-    fd = -1;
-  }
-  int fds_[2];
+  orvex::FileDescriptor read_end;
+  orvex::FileDescriptor write_end;
 };
 
 // Runs in the child between fork and exec: only async-signal-safe calls,
@@ -92,13 +81,13 @@ int RunAndWait(const char* prog, const std::vector<const char*>& args) {
     return -1;
   }
   pid_t pid = ::fork();
-  if (pid == 0) ExecChild(prog, argv.data(), pipe.write_fd());
+  if (pid == 0) ExecChild(prog, argv.data(), pipe.write_end.get());
   if (pid < 0) {
     KLIBC_ERR_SET(KLIB_ERR_EXEC);
     return -1;
   }
-  pipe.CloseWrite();
-  int exec_error = ReadExecError(pipe.read_fd());
+  pipe.write_end.reset();
+  int exec_error = ReadExecError(pipe.read_end.get());
   int status = 0;
   if (WaitChild(pid, status) != 0 || exec_error != 0 || !WIFEXITED(status)) {
     if (exec_error != 0) errno = exec_error;

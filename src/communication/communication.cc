@@ -15,7 +15,8 @@
 #include "foundation/check.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"
-#include "orvex/portable/root.h"
+#include "orvex/portable/file_descriptor.h"
+#include "platform/fixed_path.h"
 
 namespace orvex {
 namespace fileindex {
@@ -31,21 +32,6 @@ constexpr unsigned long kConnectRetryMicros = 1000000;
 // Answers are discarded; they are read through this much memory at a time
 // rather than trusting the peer's length with one allocation.
 constexpr unsigned int kDiscardBytes = 64 * 1024;
-
-// The connection's descriptor, closed on every way out of the call.
-class SocketFd {
- public:
-  explicit SocketFd(int fd) : fd_(fd) {}
-  SocketFd(const SocketFd&) = delete;
-  SocketFd& operator=(const SocketFd&) = delete;
-  ~SocketFd() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  int get() const { return fd_; }
-
- private:
-  int fd_;
-};
 
 std::string SystemReason(const char* what) {
   return std::string(what) + " failed, reason=" + std::strerror(errno);
@@ -110,8 +96,8 @@ void SendCommandToDaemon(const std::string& command, const Json::Value& data) {
   ORVEX_CHECK_AS(0 > (fd_socket = ::socket(PF_UNIX, SOCK_STREAM, 0)),
                  "0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))", kErrorSystem,
                  SystemReason("socket"));
-  SocketFd socket_fd(fd_socket);
-  ConnectWithRetry(fd_socket, portable::RootPath(kFileIndexDaemonSockPath));
+  const FileDescriptor socket_fd(fd_socket);  // closed on every way out
+  ConnectWithRetry(fd_socket, sdk::FixedPath(kFileIndexDaemonSockPath));
   SetSendTimeout(fd_socket);
   WriteRequest(fd_socket, command, data);
   ReadAndDiscardAnswer(fd_socket);

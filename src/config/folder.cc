@@ -1,5 +1,7 @@
 #include "orvex/config/folder.h"
 
+#include "orvex/config/folder_mgr.h"
+
 #include "foundation/check.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
@@ -91,6 +93,11 @@ Json::Value Folder::GetIndexCfg() const {
 }
 
 bool Folder::IsIndexing() const {
+  // Whether a folder is being indexed has always been asked with the folder
+  // configuration loaded: a malformed folders file fails the question
+  // (504) rather than answering it from the queue alone.
+  const FolderMgr folders;
+  (void)folders;
   const sdk::SDKShare share(GetShare());
   QueueMgr queue(share.GetQueuePath());
   return queue.IsFullPathProcessing(CachedFullPath());

@@ -4,10 +4,11 @@
 #include <functional>
 
 #include "foundation/check.h"
-#include "kalo/kalo_unicode.h"
+#include "foundation/path_prefix.h"
 #include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/error.h"
 #include "orvex/policy/file_type.h"
+#include "platform/text_compare.h"
 
 namespace orvex {
 namespace fileindex {
@@ -18,25 +19,12 @@ constexpr char kLogSource[] = "folder_mgr";
 using FolderPtr = FolderMgr::FolderPtr;
 using Comparator = std::function<bool(const FolderPtr&, const FolderPtr&)>;
 
-// Whether the folder at folder_full contains full_path: full_path + "/"
-// starts with folder_full + "/". Tested in place, because the governing
-// folder is looked up once per indexed file against up to a thousand
-// folders.
-bool Contains(const std::string& folder_full, const std::string& full_path) {
-  const size_t n = folder_full.size();
-  if (full_path.size() < n) return false;
-  // The boundary byte first: folders share long prefixes (volume, share,
-  // parent folders), and most of them end where full_path has no "/".
-  if (full_path.size() != n && full_path[n] != '/') return false;
-  return full_path.compare(0, n, folder_full) == 0;
-}
-
 bool FlagOffFirst(bool (Folder::*flag)() const, const FolderPtr& a, const FolderPtr& b) {
   return !((*a).*flag)() && ((*b).*flag)();
 }
 
 bool TextBefore(const std::string& a, const std::string& b) {
-  return KLIBCUnicodeUTF8StrCaseCmp(a.c_str(), b.c_str()) < 0;
+  return sdk::CompareIgnoringCase(a, b) < 0;
 }
 
 Comparator ComparatorFor(const std::string& sort_by) {
@@ -76,7 +64,7 @@ FolderPtr FolderMgr::GetMostSuitableCfg(const std::string& full_path) const {
     const std::string& folder_full = folder->CachedFullPath();
     // Strictly longer: of two folders with the same full path (duplicates)
     // the earlier one keeps governing.
-    if (folder_full.size() > best_length && Contains(folder_full, full_path)) {
+    if (folder_full.size() > best_length && IsSameOrBelow(full_path, folder_full)) {
       best = folder;
       best_length = folder_full.size();
     }
@@ -110,7 +98,7 @@ bool FolderMgr::IsFullPathHasOwnCfg(const std::string& full_path) const {
 
 bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
   return std::any_of(folders_.begin(), folders_.end(), [&full_path](const FolderPtr& folder) {
-    return Contains(folder->CachedFullPath(), full_path);
+    return IsSameOrBelow(full_path, folder->CachedFullPath());
   });
 }
 

@@ -3,6 +3,7 @@
 #include <sys/types.h>
 
 #include <algorithm>
+#include <exception>
 #include <iterator>
 
 #include "foundation/check.h"
@@ -10,6 +11,7 @@
 #include "kalo/kalo_path.h"
 #include "kalo/kalo_quota.h"
 #include "kalo/kalo_share.h"
+#include "orvex/portable/share_registry.h"
 
 namespace orvex {
 namespace sdk {
@@ -46,6 +48,38 @@ SDKShare::SDKShare(const std::string& share_name) : name_(share_name) {
   LockMutex lock(SDKMutex());
   ORVEX_CHECK(0 > KALOShareGet(share_name.c_str(), &share_info_) || !share_info_, kErrorNoShare,
               share_name);
+}
+
+SDKShare::SDKShare(KALOSHARE* share_info, const std::string& share_name)
+    : share_info_(share_info), name_(share_name) {}
+
+std::unique_ptr<SDKShare> SDKShare::Find(const std::string& share_name) {
+  LockMutex lock(SDKMutex());
+  PKALOSHARE info = nullptr;
+  KLIBCErrClear();
+  if (0 > KALOShareGet(share_name.c_str(), &info) || !info) {
+    ORVEX_CHECK_AS(KLIBCErrGet() != KLIB_ERR_NO_SUCH_SHARE,
+                   "0 > KALOShareGet(share_name.c_str(), &info) || !info", kErrorNoShare,
+                   share_name);
+    return nullptr;
+  }
+  return std::unique_ptr<SDKShare>(new SDKShare(info, share_name));
+}
+
+std::vector<ShareLocation> ListShareLocations() {
+  LockMutex lock(SDKMutex());
+  std::string problem;
+  try {
+    std::vector<ShareLocation> locations;
+    for (portable::ShareRecord& share : portable::LoadShares()) {
+      locations.push_back({std::move(share.name), std::move(share.path)});
+    }
+    return locations;
+  } catch (const std::exception& e) {
+    problem = e.what();
+  }
+  ORVEX_CHECK_AS(true, "!LoadShares()", kErrorSystem, "Cannot read shares: " + problem);
+  return {};
 }
 
 SDKShare::~SDKShare() {

@@ -6,9 +6,9 @@
 
 #include <cerrno>
 #include <fstream>
+#include <string>
+#include <vector>
 
-#include "kalo/kalo_error.h"
-#include "kalo/kalo_exec.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/lock.h"
@@ -16,9 +16,11 @@
 #include "orvex/foundation/util.h"
 #include "orvex/platform/sdk_share.h"
 #include "orvex/policy/share_path.h"
-#include "orvex/portable/root.h"
 #include "orvex/queue/queue_mgr.h"
 #include "orvex/status/status_mgr.h"
+#include "platform/fixed_path.h"
+#include "platform/platform_error.h"
+#include "platform/program.h"
 
 namespace orvex {
 namespace fileindex {
@@ -92,14 +94,14 @@ void MarkNeedReindex(const std::string& share_name) {
   }
 }
 
-// Runs the notification tool with args (ending in nullptr) and waits; only a
-// tool that cannot be run at all is logged.
-template <typename... Args>
-void RunNotifyTool(Args... args) {
-  const std::string tool = portable::RootPath(kPMXNotifyPath);
-  if (KLIBCExecl(tool.c_str(), KLIBC_EXECL_WAIT, args..., nullptr) < 0) {
-    LogPlain("%s:%d (%d, %u) KLIBCExecl failed: err=[0x%04X %s:%d]", kLogSource, __LINE__, Pid(),
-             Euid(), KLIBCErrGet(), KLIBCErrorGetFile(), KLIBCErrorGetLine());
+// Runs the notification tool with args and waits; only a tool that cannot be
+// run at all is logged.
+void RunNotifyTool(const std::vector<std::string>& args) {
+  const std::string tool = sdk::FixedPath(kPMXNotifyPath);
+  sdk::ClearPlatformError();
+  if (sdk::RunProgram(tool, args) < 0) {
+    LogPlain("%s:%d (%d, %u) KLIBCExecl failed: %s", kLogSource, __LINE__, Pid(), Euid(),
+             sdk::PlatformErrorText().c_str());
   }
   errno = 0;
 }
@@ -125,12 +127,12 @@ void AddCustomEvent(int event, const std::string& path, const std::string& path_
 }
 
 void SendPMXNotify() {
-  RunNotifyTool("-c", kNotifyApp, "-b", "true", "-e", "false", kNotifyTarget, kKeyDisplayName,
-                kKeyNoSpace, kLinkOpen, kLinkClose);
+  RunNotifyTool({"-c", kNotifyApp, "-b", "true", "-e", "false", kNotifyTarget, kKeyDisplayName,
+                 kKeyNoSpace, kLinkOpen, kLinkClose});
 }
 
 void NotifyLackOfMemory() {
-  RunNotifyTool("-c", kNotifyApp, kNotifyTarget, kKeyDisplayName, kKeyLackOfMemory);
+  RunNotifyTool({"-c", kNotifyApp, kNotifyTarget, kKeyDisplayName, kKeyLackOfMemory});
 }
 
 }  // namespace fileindex

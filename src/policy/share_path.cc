@@ -1,28 +1,18 @@
 #include "orvex/policy/share_path.h"
 
-#include <exception>
+#include <memory>
 #include <vector>
 
 #include "foundation/check.h"
-#include "kalo/kalo_error.h"
-#include "kalo/kalo_share.h"
-#include "orvex/foundation/lock.h"
+#include "foundation/path_prefix.h"
 #include "orvex/foundation/util.h"
 #include "orvex/platform/sdk_share.h"
-#include "orvex/portable/share_registry.h"
 
 namespace orvex {
 namespace fileindex {
 namespace {
 
 constexpr char kLogSource[] = "share_path";
-
-// True when path is root itself or lies below it. Roots carry no trailing
-// slash, so "/srv/a" holds "/srv/a/x" but not "/srv/ab/x".
-bool IsUnder(const std::string& path, const std::string& root) {
-  if (!StringStartWith(path, root)) return false;
-  return path.size() == root.size() || path[root.size()] == '/';
-}
 
 // The first component of an absolute path ("a" for "/a/x"); "" for "/" and
 // "//x".
@@ -35,33 +25,14 @@ bool IsShareName(const std::string& name) {
   return !name.empty() && name.find('/') == std::string::npos;
 }
 
-// Looks a share's root up in the registry. False when no share has that
-// name; any other failure of the platform throws Error 800 as SDKShare does.
-// Unlike SDKShare, an absent share is an answer here, not a failure to log.
+// Looks a share's root up. False when no share has that name; any other
+// failure of the platform throws Error 800 as SDKShare does. Unlike
+// SDKShare, an absent share is an answer here, not a failure to log.
 bool LookUpShareRoot(const std::string& name, std::string& root) {
-  LockMutex lock(sdk::SDKMutex());
-  PKALOSHARE info = nullptr;
-  KLIBCErrClear();
-  if (0 > KALOShareGet(name.c_str(), &info) || !info) {
-    ORVEX_CHECK_AS(KLIBCErrGet() != KLIB_ERR_NO_SUCH_SHARE,
-                   "0 > KALOShareGet(name.c_str(), &info) || !info", kErrorNoShare, name);
-    return false;
-  }
-  root = info->szPath;
-  KALOShareFree(info);
+  const std::unique_ptr<sdk::SDKShare> share = sdk::SDKShare::Find(name);
+  if (!share) return false;
+  root = share->GetPath();
   return true;
-}
-
-std::vector<portable::ShareRecord> LoadRegisteredShares() {
-  LockMutex lock(sdk::SDKMutex());
-  std::string problem;
-  try {
-    return portable::LoadShares();
-  } catch (const std::exception& e) {
-    problem = e.what();
-  }
-  ORVEX_CHECK_AS(true, "!LoadShares()", kErrorSystem, "Cannot read shares: " + problem);
-  return {};
 }
 
 }  // namespace
@@ -83,10 +54,10 @@ std::string GetFullPath(const std::string& share_relative_path) {
 
 void GetShareNamePathByFullPath(const std::string& full_path, std::string& share_name,
                                 std::string& share_path) {
-  const portable::ShareRecord* best = nullptr;
-  const std::vector<portable::ShareRecord> shares = LoadRegisteredShares();
-  for (const portable::ShareRecord& share : shares) {
-    if (!IsUnder(full_path, share.path)) continue;
+  const sdk::ShareLocation* best = nullptr;
+  const std::vector<sdk::ShareLocation> shares = sdk::ListShareLocations();
+  for (const sdk::ShareLocation& share : shares) {
+    if (!IsSameOrBelow(full_path, share.path)) continue;
     if (best == nullptr || share.path.size() > best->path.size()) best = &share;
   }
   ORVEX_CHECK(best == nullptr, kErrorBadArgument, "Cannot find share: " + full_path);
@@ -103,7 +74,7 @@ std::string ReplacePathShare(const std::string& path, const std::string& share_t
               "Invalid share_from: [" + share_from + "]");
   std::string root_from;
   const bool from_registered = LookUpShareRoot(share_from, root_from);
-  if (from_registered && IsUnder(path, root_from)) {
+  if (from_registered && IsSameOrBelow(path, root_from)) {
     return sdk::SDKShare(share_to).GetPath() + path.substr(root_from.size());
   }
   // The share was renamed where it stands: the registry already knows only
@@ -111,7 +82,7 @@ std::string ReplacePathShare(const std::string& path, const std::string& share_t
   std::string root_to;
   if (!from_registered && LookUpShareRoot(share_to, root_to) && Basename(root_to) == share_to) {
     const std::string old_root = Dirname(root_to) + "/" + share_from;
-    if (IsUnder(path, old_root)) return root_to + path.substr(old_root.size());
+    if (IsSameOrBelow(path, old_root)) return root_to + path.substr(old_root.size());
   }
   ORVEX_CHECK(FirstComponent(path) != share_from, kErrorBadArgument,
               "Path [" + path + "] is not in share [" + share_from + "]");

@@ -3,6 +3,7 @@
 // asymmetric (a modify after a pending delete is absorbed, a create after one
 // revives the file) and must be kept exactly as they are.
 
+#include "foundation/path_prefix.h"
 #include "orvex/foundation/error.h"
 #include "orvex/queue/op_tree.h"
 #include "queue/event_parser.h"
@@ -224,8 +225,7 @@ void OPTree::FoldRename(OPNode& node_ref, const std::shared_ptr<OP>& op) {
   // would copy the source's subtree into itself, doubling it with every
   // repetition, so the line is refused before anything changes.
   // (An empty old path is no directory at all: the lookup below refuses it.)
-  if (!old_path.empty() && new_path.size() > old_path.size() &&
-      new_path.compare(0, old_path.size(), old_path) == 0 && new_path[old_path.size()] == '/') {
+  if (!old_path.empty() && new_path != old_path && IsSameOrBelow(new_path, old_path)) {
     throw Error(kErrorBadArgument, "Rename into its own subtree: " + old_path + " -> " + new_path);
   }
   OPNode& old_node = *NodeOf(old_path);

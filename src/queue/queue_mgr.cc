@@ -7,7 +7,6 @@
 #include <cstring>
 
 #include "foundation/check.h"
-#include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/lock.h"
 #include "orvex/queue/event.h"
 #include "queue/queue_scan.h"
@@ -69,10 +68,6 @@ int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& f, bool 
 void QueueMgr::DeleteTmp() { ::unlink(queue_path_tmp_.c_str()); }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
-  // The folder configuration is loaded for the call, as it always has
-  // been: a malformed folder file fails this query too (504).
-  const FolderMgr folders;
-  (void)folders;
   auto touches = [&full_path](const Event& event) {
     return IsSameOrBelow(event.path, full_path) || IsSameOrBelow(event.path_old, full_path);
   };

@@ -15,6 +15,7 @@
 
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <memory>
 
 #include "orvex/foundation/error.h"
@@ -138,6 +139,40 @@ TEST_F(FolderMgrTest, BadFilesFailTheWholeLoad) {
     ASSERT_EQ(1u, log.lines().size());
     EXPECT_EQ(0u, log.lines()[0].rfind("folder_mgr:", 0)) << log.lines()[0];
   }
+}
+
+// A link or a directory where the folder list belongs is reported, never
+// read as "no folders" and never replaced by a save.
+TEST_F(FolderMgrTest, ALinkOrDirectoryInTheFilesPlaceIsReportedAndNeverReplaced) {
+  WriteEtc("real.folders", "[]");
+  const struct {
+    const char* what;
+    std::function<void()> make;
+    std::string reason;
+  } cases[] = {
+      {"link to a good file",
+       [&] { std::filesystem::create_symlink("real.folders", FoldersFile()); },
+       "Cannot load json: " + FoldersFile() + " is a symbolic link"},
+      {"dangling link", [&] { std::filesystem::create_symlink("gone", FoldersFile()); },
+       "Cannot load json: " + FoldersFile() + " is a symbolic link"},
+      {"directory", [&] { std::filesystem::create_directory(FoldersFile()); },
+       "Cannot load json: " + FoldersFile() + " is a directory"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.what);
+    std::filesystem::remove(FoldersFile());
+    FolderMgr loaded_before;  // no file yet: an empty list
+    c.make();
+    std::string reason;
+    EXPECT_EQ(kErrorLoadJson, CodeOf([] { FolderMgr mgr; }, &reason));
+    EXPECT_EQ(c.reason, reason);
+    EXPECT_EQ(kErrorSaveJson, CodeOf([&] { loaded_before.Save(); }));
+    const auto status = std::filesystem::symlink_status(FoldersFile());
+    EXPECT_NE(std::filesystem::file_type::regular, status.type()) << "replaced by the save";
+  }
+  Json::Value real;
+  EXPECT_TRUE(fromFile(real, dir_.Join("var/packages/Orvex/etc/real.folders")));
+  EXPECT_EQ(Json::Value(Json::arrayValue), real) << "the link's target must stay as it was";
 }
 
 TEST_F(FolderMgrTest, TheThousandAndFirstFolderIsRefusedAndNeverSaved) {
@@ -291,6 +326,15 @@ TEST_F(FolderStatusTest, InvalidPathOutranksNeedReindexWhichOutranksPendingEvent
   EXPECT_EQ("need_reindex", Status());
   EXPECT_EQ("error/invalid_path", Status("/photo/@eaDir"));
   EXPECT_EQ("error/invalid_path", Status("/nosuchshare/a"));
+}
+
+TEST_F(FolderStatusTest, PendingEventsAreAskedWithTheFolderConfigurationLoaded) {
+  WriteStatus(-1);
+  QueueCreate(root_ + "/a/x.jpg");
+  WriteEtc("fileindex.folders", "{broken");
+  Json::Value out(Json::objectValue);
+  EXPECT_EQ(kErrorLoadJson,
+            CodeOf([&] { Folder("/photo/a", "A", true, true, true, true, false).GetStatus(out); }));
 }
 
 TEST_F(FolderStatusTest, AdditionalStatusSectionAndItsFailures) {

@@ -4,6 +4,7 @@
 #include <pwd.h>
 #include <unistd.h>
 
+#include <memory>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -12,7 +13,9 @@
 #include "orvex/foundation/error.h"
 #include "orvex/platform/sdk_credentials.h"
 #include "orvex/platform/sdk_share.h"
+#include "platform/program.h"
 #include "platform/share_test_root.h"
+#include "support/error_code.h"
 #include "support/log_capture.h"
 
 namespace orvex {
@@ -98,6 +101,50 @@ TEST_F(SDKShareTest, UnknownShareThrows800AndLogsTheFailedCheck) {
   // The failed constructor left the process-wide mutex free.
   ASSERT_TRUE(SDKMutex().TryLock());
   SDKMutex().Unlock();
+}
+
+TEST_F(SDKShareTest, FindAnswersNullForAMissingShareAndThrowsForAnUnreadableRegistry) {
+  const std::string root = AddShare("photo");
+  {
+    testing::LogCapture log;
+    EXPECT_EQ(SDKShare::Find("nosuch"), nullptr);
+    EXPECT_TRUE(log.lines().empty()) << "a missing share is an answer, not a failure";
+    const std::unique_ptr<SDKShare> found = SDKShare::Find("photo");
+    ASSERT_NE(found, nullptr);
+    EXPECT_EQ(found->GetPath(), root);
+    EXPECT_EQ(found->GetName(), "photo");
+  }
+  WriteRegistryText("[{\"name\": \"photo\"}]");  // no path: the record cannot be read
+  EXPECT_EQ(testing::CodeOf([] { SDKShare::Find("photo"); }), kErrorNoShare);
+  EXPECT_EQ(testing::CodeOf([] { SDKShare::Find("other"); }), kErrorNoShare);
+}
+
+TEST_F(SDKShareTest, ListShareLocationsKeepsRegistryOrderAndNamesTheCauseOfAFailure) {
+  EXPECT_TRUE(ListShareLocations().empty()) << "no registry file means no shares";
+  const std::string b = AddShare("b");
+  const std::string a = AddShare("a", Json::objectValue, "volume2/a");
+  const std::vector<ShareLocation> shares = ListShareLocations();
+  ASSERT_EQ(shares.size(), 2u);
+  EXPECT_EQ(std::make_tuple(shares[0].name, shares[0].path, shares[1].name, shares[1].path),
+            std::make_tuple("b", b, "a", a));
+  WriteRegistryText("{not json");
+  std::string reason;
+  EXPECT_EQ(testing::CodeOf([] { ListShareLocations(); }, &reason), kErrorSystem);
+  EXPECT_THAT(reason, ::testing::StartsWith("Cannot read shares: "));
+  EXPECT_THAT(reason, ::testing::HasSubstr("shares.json"));
+}
+
+TEST(RunProgramTest, PassesEveryArgumentAndReportsTheExitStatus) {
+  // sh -c SCRIPT NAME ARGS...: the script sees ARGS as $1..., and exits with
+  // their count, so a lost or extra argument changes the status.
+  const std::vector<std::string> fourteen = {"-c", "exit $#", "sh", "1", "2", "3", "4",
+                                             "5",  "6",       "7",  "8", "9", "10", ""};
+  EXPECT_EQ(RunProgram("/bin/sh", fourteen), 11);
+  EXPECT_EQ(RunProgram("/bin/sh", {"-c", "exit 7"}), 7);
+  EXPECT_EQ(RunProgramShort("/bin/sh", {"-c", "exit 3"}), 3);
+  EXPECT_EQ(RunProgram("/no/such/program", {}), -1);
+  EXPECT_EQ(RunProgram("/bin/true", std::vector<std::string>(kMaxProgramArgs + 1, "x")), -1);
+  EXPECT_EQ(RunProgramShort("/bin/true", {"1", "2", "3", "4", "5"}), -1);
 }
 
 }  // namespace

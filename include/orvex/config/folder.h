@@ -68,9 +68,10 @@ class ORVEX_EXPORT Folder {
   Json::Value GetIndexCfg() const;
 
   // True while events for this folder or anything below it wait in the
-  // share's event queue (live or snapshot). Throws Error 800 for an unknown
-  // share, 502 when the queue cannot be read, and the queue line errors
-  // (906, 120) for a malformed line.
+  // share's event queue (live or snapshot). Asked with the folder
+  // configuration loaded: throws Error 504 when the folders file is
+  // malformed, 800 for an unknown share, 502 when the queue cannot be read,
+  // and the queue line errors (906, 120) for a malformed line.
   bool IsIndexing() const;
 
   // Sets out["text"] to "error" (with out["desc"] "invalid_path"),

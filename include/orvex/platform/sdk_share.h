@@ -8,7 +8,9 @@
 #ifndef ORVEX_PLATFORM_SDK_SHARE_H_
 #define ORVEX_PLATFORM_SDK_SHARE_H_
 
+#include <memory>
 #include <string>
+#include <vector>
 
 #include "orvex/export.h"
 #include "orvex/foundation/lock.h"
@@ -23,12 +25,30 @@ namespace sdk {
 // for the whole process; never destroyed while in use.
 ORVEX_EXPORT Mutex& SDKMutex();
 
+// Where one share lives: its name and its root directory (absolute, no
+// trailing slash).
+struct ShareLocation {
+  std::string name;
+  std::string path;
+};
+
+// Every share the platform knows, in the platform's order, under SDKMutex().
+// Throws Error 502 "Cannot read shares: <cause>" (logged) when the platform's
+// share list cannot be read.
+ORVEX_EXPORT std::vector<ShareLocation> ListShareLocations();
+
 class ORVEX_EXPORT SDKShare {
  public:
   // Opens the platform record of share_name (exact case) under SDKMutex().
   // Throws Error 800 with the share name as the reason (after logging the
   // failed check) when the share does not exist or its record cannot be read.
   explicit SDKShare(const std::string& share_name);
+
+  // Opens share_name like the constructor, but a share that does not exist
+  // is an answer, not a failure: returns null without logging. Any other
+  // failure to read the record throws Error 800 as the constructor does.
+  static std::unique_ptr<SDKShare> Find(const std::string& share_name);
+
   SDKShare(const SDKShare&) = delete;
   SDKShare& operator=(const SDKShare&) = delete;
   // Releases the record under SDKMutex().
@@ -79,6 +99,9 @@ class ORVEX_EXPORT SDKShare {
   bool CanBeIndexed() const;
 
  private:
+  // Takes ownership of an open record.
+  SDKShare(KALOSHARE* share_info, const std::string& share_name);
+
   KALOSHARE* share_info_ = nullptr;  // owned, released by the destructor
   std::string name_;
 };

@@ -59,15 +59,14 @@ class ORVEX_EXPORT QueueMgr {
   // prefix: "/v/s/a" covers "/v/s/a/b", not "/v/s/ab") has an event in the
   // live queue or the snapshot, as the changed path or as the old path of a
   // rename. A last line without its newline is one a producer is still
-  // appending and is not looked at. Loads the folder configuration for the
-  // duration of the call (Error 504 when it is malformed). Throws Error 502
-  // when a queue file exists but cannot be read, and the Event errors (906,
-  // 120) for a malformed line.
+  // appending and is not looked at. Throws Error 502 when a queue file exists
+  // but cannot be read, and the Event errors (906, 120) for a malformed
+  // line.
   bool IsFullPathProcessing(const std::string& full_path);
 
   // True when a pure re-index (mask exactly EVENT_REINDEX) of full_path or
   // of one of its ancestors waits in the live queue or the snapshot. Throws
-  // as IsFullPathProcessing, except for the folder configuration.
+  // as IsFullPathProcessing.
   bool IsFullPathHasReindex(const std::string& full_path);
 
   const std::string& queue_path() const { return queue_path_; }

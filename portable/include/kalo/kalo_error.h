@@ -4,6 +4,9 @@
 // back with KLIBCErrGet, KLIBCErrorGetFile and KLIBCErrorGetLine, typically
 // to log "err=[0x%04X %s:%d]". A successful call leaves the last error as it
 // was. Thread-safe: the last error is kept per thread.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_ERROR_H_
 #define KALO_KALO_ERROR_H_
 

@@ -4,6 +4,9 @@
 // and starts with an empty signal mask. The caller must not have SIGCHLD set
 // to SIG_IGN, or the exit status is lost. Thread-safe: the child runs only
 // async-signal-safe code between fork and exec.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_EXEC_H_
 #define KALO_KALO_EXEC_H_
 

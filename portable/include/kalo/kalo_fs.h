@@ -3,6 +3,9 @@
 // (so ACLs and root's privileges count as the kernel applies them), and a
 // directory is a mount point when its device differs from its parent's.
 // Thread-safe.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_FS_H_
 #define KALO_KALO_FS_H_
 

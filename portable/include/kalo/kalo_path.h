@@ -1,6 +1,9 @@
 // Composition of the file-index paths of a share. Both live in the share's
 // metadata folder, so they move with the share when it is renamed or moved to
 // another volume. Thread-safe (pure functions).
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_PATH_H_
 #define KALO_KALO_PATH_H_
 

@@ -1,6 +1,9 @@
 // The platform's free-space check. On Linux it asks the file system holding a
 // path how many bytes an unprivileged user may still write there; per-user
 // disk quotas are not consulted. Thread-safe.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_QUOTA_H_
 #define KALO_KALO_QUOTA_H_
 

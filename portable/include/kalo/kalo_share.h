@@ -5,6 +5,9 @@
 // return a negative value (or false) and set the last error (kalo_error.h).
 // Thread-safe: calls share no state beyond the registry file; one record may
 // be queried from several threads but freed only once.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_SHARE_H_
 #define KALO_KALO_SHARE_H_
 

@@ -1,5 +1,8 @@
 // UTF-8 text comparison without regard to letter case, by Unicode default
 // case folding (ICU), so "é" equals "É" and "ß" equals "SS". Thread-safe.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_UNICODE_H_
 #define KALO_KALO_UNICODE_H_
 

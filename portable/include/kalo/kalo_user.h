@@ -4,6 +4,9 @@
 // supplementary groups), keeping the real and saved ids, so a process started
 // as root can always return to root. One thread at a time: credentials are
 // process-wide state; callers serialise switches themselves.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef KALO_KALO_USER_H_
 #define KALO_KALO_USER_H_
 

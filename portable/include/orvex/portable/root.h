@@ -3,6 +3,9 @@
 // opened under the directory named by the environment variable ORVEX_ROOT when
 // it is set and not empty, and as it stands otherwise. Share paths and full
 // paths inside shares are never rewritten. Safe for concurrent use.
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef ORVEX_PORTABLE_ROOT_H_
 #define ORVEX_PORTABLE_ROOT_H_
 
