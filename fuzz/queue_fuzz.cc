@@ -3,7 +3,7 @@
 // every operation is handed out and printed, as the indexing daemon would.
 // Besides the sanitizers' findings it traps when a handed-out operation breaks
 // the tree's promises: a cancelled or unknown kind, a crash operation in a
-// queue not marked crashed, or a path that is not absolute.
+// queue not marked crashed, a path that is not absolute or holds a NUL byte.
 #include <fcntl.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -73,6 +73,8 @@ void Touch(const OPTree& tree, const std::shared_ptr<OP>& op, std::ostringstream
   Check((op->kind == orvex::fileindex::OP_QUEUE_CRASHED) == tree.crashed());
   const std::string path = op->node->GetPath();
   Check(tree.crashed() ? path.empty() : (path.size() > 1 && path[0] == '/'));
+  // A NUL byte would cut the path short in every file-system call.
+  Check(path.find('\0') == std::string::npos && op->path.find('\0') == std::string::npos);
 }
 
 }  // namespace

@@ -18,6 +18,8 @@ void GetOptional(T& out, const Json::Value& obj, const char* key) {
   }
 }
 
+bool HoldsNul(const std::string& path) { return path.find('\0') != std::string::npos; }
+
 }  // namespace
 
 void ParseEventJson(const std::string& event_raw, EventFields& out) {
@@ -33,6 +35,10 @@ void ParseEventJson(const std::string& event_raw, EventFields& out) {
   GetJsonValue<std::string>(out.path, data_json, "path", /*required=*/true);
   GetOptional<std::string>(out.path_old, data_json, "path_old");
   GetOptional<Json::Value>(out.data, data_json, "data");
+  // Every file-system call reads a path up to its first NUL byte: such a
+  // path would name another file than the event's.
+  ORVEX_CHECK(HoldsNul(out.path) || HoldsNul(out.path_old), kErrorMalformedEvent,
+              "Malformed event_raw: " + event_raw);
 }
 
 Event::Event(const std::string& event_raw) {

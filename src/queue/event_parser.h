@@ -28,12 +28,14 @@ struct EventFields {
 // and, when present, "is_dir" true or false, "path_old" a string and "data"
 // null, none of them repeated. Returns false, leaving out untouched, for any
 // other line; ParseEventJson then decides it, so the result never differs
-// from what ParseEventJson gives.
+// from what ParseEventJson gives. A NUL byte can never reach a path from
+// here (neither raw control bytes nor \u escapes are taken).
 bool ParseEventFast(const std::string& line, EventFields& out);
 
 // The general parse: any JSON text. Throws Error 906 (logged first) when the
-// line is not JSON and Error 120 when "event" or "path" is missing or
-// mistyped; out may then be partly filled.
+// line is not JSON or "path" or "path_old" holds a NUL byte ("\u0000"), and
+// Error 120 when "event" or "path" is missing or mistyped; out may then be
+// partly filled.
 void ParseEventJson(const std::string& line, EventFields& out);
 
 }  // namespace fileindex

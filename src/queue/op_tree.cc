@@ -50,6 +50,9 @@ void OPTree::FoldLine(const AheadLine& line) {
   ++lines_read_;
   if (log_level == 7) LogPlain("%s:%d Got event: %s", kLogSource, __LINE__, line.text.c_str());
   try {
+    // BuildTree's reader has the default cap.
+    ORVEX_CHECK(line.too_long, kErrorMalformedEvent,
+                LongLineReason(line.text, line.length, LineReader::kDefaultMaxLine));
     // What Event's constructor does, without a heap object per line: the
     // common shape was scanned into the line's fields, anything else is
     // parsed afresh by the JSON parser.
@@ -62,9 +65,10 @@ void OPTree::FoldLine(const AheadLine& line) {
     }
   } catch (const Error& e) {
     ++lines_skipped_;
+    const std::string raw = line.too_long ? LongLineHead(line.text) : line.text;
     LogErrno("%s:%d (%d, %u) InsertEvent failed, event_raw=%s, code=%d, reason=%s", kLogSource,
              __LINE__, static_cast<int>(::getpid()), static_cast<unsigned>(::geteuid()),
-             line.text.c_str(), static_cast<int>(e.code()), e.reason().c_str());
+             raw.c_str(), static_cast<int>(e.code()), e.reason().c_str());
   }
 }
 

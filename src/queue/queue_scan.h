@@ -8,8 +8,9 @@
 
 #include <functional>
 #include <string>
-#include <string_view>
 
+// The scans' callers test paths with IsSameOrBelow.
+#include "foundation/path_prefix.h"
 #include "orvex/queue/event.h"
 
 namespace orvex {
@@ -21,12 +22,10 @@ namespace fileindex {
 // its newline is one a producer is still appending and is not looked at.
 // Throws Error 502 "Failed to open queue, reason=..." (logged, source
 // "queue_mgr", condition "!input_stream") when the file cannot be read, and
-// Event's errors (906, 120) at the first malformed line before a match.
+// Event's errors (906, 120) at the first malformed line before a match; a
+// line longer than LineReader's cap is malformed (906, logged with its
+// length and only its first bytes).
 bool ScanQueue(const std::string& path, const std::function<bool(const Event&)>& matches);
-
-// (path + "/") starts with (dir + "/"): path is dir or lies below it, whole
-// components only ("/v/a" covers "/v/a/b", not "/v/ab").
-bool IsSameOrBelow(std::string_view path, std::string_view dir);
 
 }  // namespace fileindex
 }  // namespace orvex

@@ -37,10 +37,13 @@ bool ReadAhead::ReadOne() {
   more_ = reader_.Next(line.text);
   errno = saved_errno;
   if (!more_) return false;
+  line.too_long = reader_.last_line_too_long();
+  line.length = reader_.last_line_length();
   line.fields.is_dir = false;
   line.fields.path_old.clear();
   line.fields.data = Json::Value();
-  line.scanned = ParseEventFast(line.text, line.fields);
+  // The head of an over-long line may well scan as an event on its own.
+  line.scanned = !line.too_long && ParseEventFast(line.text, line.fields);
   line.keys = line.scanned ? NodeIndex::KeysOf(line.fields.path) : PathKeys();
   line.candidate = nullptr;
   if (line.keys.canonical) index_.Prefetch(line.keys.key);

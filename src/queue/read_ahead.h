@@ -8,6 +8,7 @@
 #define ORVEX_SRC_QUEUE_READ_AHEAD_H_
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -19,10 +20,12 @@ namespace orvex {
 namespace fileindex {
 
 struct AheadLine {
-  std::string text;
+  std::string text;       // only the head of a line over the reader's cap
+  bool too_long = false;  // the line was over the cap: a bad line
+  uint64_t length = 0;    // its full length, newline excluded
   EventFields fields;
-  bool scanned = false;  // fields hold the line; otherwise parse it in turn
-  PathKeys keys;         // of fields.path, when scanned
+  bool scanned = false;               // fields hold the line; otherwise parse it in turn
+  PathKeys keys;                      // of fields.path, when scanned
   const OPNode* candidate = nullptr;  // its node as far as known, unconfirmed
 };
 
@@ -36,9 +39,9 @@ class ReadAhead {
   AheadLine* Next();
 
  private:
-  static constexpr size_t kLines = 16;           // the lines in flight
-  static constexpr size_t kBytes = 1 << 20;      // but no more bytes than this
-  static constexpr size_t kStageDistance = 4;    // lines between two stages
+  static constexpr size_t kLines = 16;               // the lines in flight
+  static constexpr size_t kBytes = 1 << 20;          // but no more bytes than this
+  static constexpr size_t kStageDistance = 4;        // lines between two stages
   static constexpr size_t kKeepCapacity = 64 << 10;  // larger line buffers shrink
 
   AheadLine& At(size_t age) { return ring_[(first_ + age) % kLines]; }
@@ -50,10 +53,10 @@ class ReadAhead {
   LineReader& reader_;
   const NodeIndex& index_;
   std::vector<AheadLine> ring_;
-  size_t first_ = 0;  // the ring position of the line handed out next
-  size_t count_ = 0;  // lines read and not yet handed out
-  size_t bytes_ = 0;  // their bytes
-  bool more_ = true;  // the file may hold more lines
+  size_t first_ = 0;     // the ring position of the line handed out next
+  size_t count_ = 0;     // lines read and not yet handed out
+  size_t bytes_ = 0;     // their bytes
+  bool more_ = true;     // the file may hold more lines
   bool handed_ = false;  // the line at first_ was handed out by the last call
 };
 

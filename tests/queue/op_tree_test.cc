@@ -9,6 +9,7 @@
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/queue/op.h"
+#include "queue/line_reader.h"
 #include "support/log_capture.h"
 #include "support/temp_dir.h"
 
@@ -175,17 +176,53 @@ TEST_F(OPTreeTest, BadLinesAreLoggedAndSkippedAndEveryLineTraced) {
   EXPECT_EQ(log_.Matching("Got event: ").size(), 7u);
 }
 
-TEST_F(OPTreeTest, HugeLinesNulBytesInvalidUtf8AndAnUnterminatedLastLine) {
-  const std::string huge = "/s/" + std::string(3 << 20, 'x');
-  const std::string text = Ev("c " + huge) + "\n" +
+TEST_F(OPTreeTest, LongLinesNulBytesInvalidUtf8AndAnUnterminatedLastLine) {
+  // The longest line kept: exactly the cap.
+  const std::string long_path = "/s/long/" + std::string(1 << 19, 'x');
+  std::string at_cap = Ev("c " + long_path);
+  const std::string fill(LineReader::kDefaultMaxLine - at_cap.size(), ' ');
+  at_cap += fill;
+  const std::string text = at_cap + "\n" +
                            std::string("{\"event\":64,\"path\":\"/s/a\0b\"}\n", 29) +
+                           R"({"event":64,"path":"/s/a\u0000b"})" + "\n" +
+                           R"({"event":256,"path":"/s/b","path_old":"/s/\u0000"})" + "\n" +
                            std::string(1 << 20, '[') + "\n" + Ev("c /s/\xff\xfe/bad");
   OPTree tree(dir_.Write("q", text));
-  EXPECT_EQ(tree.lines_read(), 4u);
-  const Ops ops = Drain(tree);
-  ASSERT_GE(ops.size(), 2u);
-  EXPECT_EQ(ops.front(), "[02] " + huge);
-  EXPECT_EQ(ops.back(), "[02] /s/\xff\xfe/bad");
+  EXPECT_EQ(tree.lines_read(), 6u);
+  EXPECT_EQ(tree.lines_skipped(), 4u);
+  EXPECT_EQ(Drain(tree), (Ops{"[02] " + long_path, "[02] /s/\xff\xfe/bad"}));
+  const std::string nul_path = R"({"event":64,"path":"/s/a\u0000b"})";
+  EXPECT_EQ(log_.Matching("code=906, reason=Malformed event_raw: " + nul_path).size(), 1u);
+}
+
+TEST_F(OPTreeTest, OverLongLinesAreSkippedAndLoggedShortenedWhileTheirNeighboursFold) {
+  // Valid JSON, and its head alone would scan as a create of /s/evil: the
+  // length decides, not the head.
+  const std::string long_create = Ev("c /s/evil") + std::string(LineReader::kDefaultMaxLine, ' ');
+  const std::string long_garbage(3 * LineReader::kDefaultMaxLine, 'z');
+  const std::string text = Ev("c /s/a") + "\n" + long_create + "\n" + Ev("m /s/a") + "\n" +
+                           long_garbage + "\n" + Ev("c /s/b") + "\n" + long_garbage;
+  auto tree = std::make_unique<OPTree>(dir_.Write("q", text));
+  EXPECT_EQ(tree->lines_read(), 6u);
+  EXPECT_EQ(tree->lines_skipped(), 3u);
+  EXPECT_EQ(Drain(*tree), (Ops{"[02] /s/a", "[02] /s/b"}));
+  const auto failures = log_.Matching("InsertEvent failed, event_raw=");
+  ASSERT_EQ(failures.size(), 3u);
+  const struct {
+    std::string head;
+    size_t length;
+  } expected[] = {{long_create.substr(0, LineReader::kLongLineHead), long_create.size()},
+                  {std::string(LineReader::kLongLineHead, 'z'), long_garbage.size()},
+                  {std::string(LineReader::kLongLineHead, 'z'), long_garbage.size()}};
+  for (size_t i = 0; i < failures.size(); ++i) {
+    const std::string& line = failures[i];
+    SCOPED_TRACE(line.substr(0, 300));
+    const std::string reason = "Malformed event_raw of " + std::to_string(expected[i].length) +
+                               " bytes, longer than 1048576: " + expected[i].head + "...";
+    EXPECT_NE(line.find("event_raw=" + expected[i].head + "..., code=906, reason=" + reason),
+              std::string::npos);
+    EXPECT_LT(line.size(), 800u);
+  }
 }
 
 TEST_F(OPTreeTest, MissingQueueOrADirectoryFailsWith502) {

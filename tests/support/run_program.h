@@ -5,6 +5,7 @@
 #define ORVEX_TESTS_SUPPORT_RUN_PROGRAM_H_
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -22,6 +23,7 @@ struct ProgramOutcome {
   int status = -1;  // exit status, -1 when the program did not exit normally
   std::string out;
   std::string err;
+  long max_rss_kb = -1;  // the child's peak resident memory
 };
 
 inline std::string ReadFileText(const std::string& path) {
@@ -40,10 +42,11 @@ inline std::vector<std::string> SplitLines(const std::string& text) {
 
 // Runs program with args; env holds "NAME=value" entries that replace the
 // same names of this process's environment. io_dir receives the captured
-// output files.
+// output files. The child reads input_path (a file or a FIFO) as its
+// standard input when one is given, else this process's.
 inline ProgramOutcome RunProgram(const std::string& program, const std::vector<std::string>& args,
-                                 const std::vector<std::string>& env,
-                                 const std::string& io_dir) {
+                                 const std::vector<std::string>& env, const std::string& io_dir,
+                                 const std::string& input_path = std::string()) {
   const std::string out_path = io_dir + "/stdout";
   const std::string err_path = io_dir + "/stderr";
   std::vector<std::string> env_text = env;
@@ -69,13 +72,19 @@ inline ProgramOutcome RunProgram(const std::string& program, const std::vector<s
     const int out = ::open(out_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
     const int err = ::open(err_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
     if (out < 0 || err < 0 || ::dup2(out, 1) < 0 || ::dup2(err, 2) < 0) ::_exit(127);
+    if (!input_path.empty()) {
+      const int in = ::open(input_path.c_str(), O_RDONLY);
+      if (in < 0 || ::dup2(in, 0) < 0) ::_exit(127);
+    }
     ::execve(program.c_str(), argv.data(), envp.data());
     ::_exit(127);
   }
   ProgramOutcome outcome;
   int status = 0;
-  if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return outcome;
+  struct rusage usage {};
+  if (pid < 0 || ::wait4(pid, &status, 0, &usage) != pid) return outcome;
   if (WIFEXITED(status)) outcome.status = WEXITSTATUS(status);
+  outcome.max_rss_kb = usage.ru_maxrss;
   outcome.out = ReadFileText(out_path);
   outcome.err = ReadFileText(err_path);
   return outcome;
