@@ -6,29 +6,39 @@ set(ORVEX_SUBSYSTEMS "" CACHE INTERNAL "")
 set(ORVEX_PROGRAMS "" CACHE INTERNAL "")
 set(ORVEX_STATIC_LIBS "" CACHE INTERNAL "")
 
-# A static internal library from every .cc of DIR; an empty placeholder
-# (INTERFACE) while the directory has no sources yet.
+# A static internal library from every .cc of DIR. A directory without sources
+# is an error rather than an empty placeholder: a placeholder would satisfy
+# every target that names it while building nothing, hiding a subsystem that
+# was declared but never written. WORKER_ONLY keeps the library out of
+# libfileindex (code that only the extraction worker may run).
 function(orvex_internal_library name)
-  cmake_parse_arguments(ARG "" "DIR" "DEPS" ${ARGN})
+  cmake_parse_arguments(ARG "WORKER_ONLY" "DIR" "DEPS" ${ARGN})
   file(GLOB srcs CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/${ARG_DIR}/*.cc)
-  if(srcs)
-    add_library(${name} STATIC ${srcs})
-    target_link_libraries(${name} PUBLIC ${ARG_DEPS})
-    target_include_directories(${name} PUBLIC
-      $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>
-      PRIVATE ${PROJECT_SOURCE_DIR}/src)
-    target_compile_definitions(${name} PRIVATE ORVEX_BUILDING_LIBRARY)
+  if(NOT srcs)
+    message(FATAL_ERROR
+      "${name}: ${ARG_DIR}/ has no sources yet. Declare the subsystem in "
+      "CMakeLists.txt when its first source lands.")
+  endif()
+  add_library(${name} STATIC ${srcs})
+  target_link_libraries(${name} PUBLIC ${ARG_DEPS})
+  target_include_directories(${name} PUBLIC
+    $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>
+    PRIVATE ${PROJECT_SOURCE_DIR}/src)
+  target_compile_definitions(${name} PRIVATE ORVEX_BUILDING_LIBRARY)
+  if(NOT ARG_WORKER_ONLY)
     set(ORVEX_STATIC_LIBS "${ORVEX_STATIC_LIBS};${name}" CACHE INTERNAL "")
-  else()
-    add_library(${name} INTERFACE)
-    target_link_libraries(${name} INTERFACE ${ARG_DEPS})
-    target_include_directories(${name} INTERFACE
-      $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>)
   endif()
 endfunction()
 
 function(orvex_subsystem sub)
   cmake_parse_arguments(ARG "" "" "DEPS" ${ARGN})
+  set(layer_deps "")
+  foreach(dep ${ARG_DEPS})
+    if(dep MATCHES "^orvex_(.+)$" AND NOT dep STREQUAL "orvex_portable")
+      list(APPEND layer_deps ${CMAKE_MATCH_1})
+    endif()
+  endforeach()
+  orvex_layer_declare(${sub} ${layer_deps})
   orvex_internal_library(orvex_${sub} DIR src/${sub} DEPS ${ARG_DEPS})
   set(ORVEX_SUBSYSTEMS "${ORVEX_SUBSYSTEMS};${sub}" CACHE INTERNAL "")
 endfunction()
@@ -54,11 +64,19 @@ function(orvex_shared_library)
   add_library(fileindex SHARED ${PROJECT_SOURCE_DIR}/cmake/fileindex_version.cc ${objects})
   target_link_libraries(fileindex PUBLIC PkgConfig::JSONCPP
                         PRIVATE ICU::uc ICU::i18n Threads::Threads)
+  # The generated orvex/version.h sits in the build tree until it is installed
+  # beside the other headers.
   target_include_directories(fileindex PUBLIC
     $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>
+    $<BUILD_INTERFACE:${PROJECT_BINARY_DIR}/include>
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
+  # The public headers use C++17 (std::string_view, inline variables), so a
+  # program linking Orvex::fileindex is compiled as C++17 at least.
+  target_compile_features(fileindex PUBLIC cxx_std_17)
   set_target_properties(fileindex PROPERTIES
     VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR})
+  # The same name inside this build as in the installed package.
+  add_library(Orvex::fileindex ALIAS fileindex)
   # Every symbol must resolve at link time, except under clang's sanitizers,
   # whose runtime only the executable brings.
   if(NOT (ORVEX_BUILD_FUZZ OR (ORVEX_SANITIZE AND CMAKE_CXX_COMPILER_ID STREQUAL "Clang")))
@@ -80,9 +98,13 @@ function(orvex_programs)
         set(ORVEX_PROGRAMS "${ORVEX_PROGRAMS};${prog}" CACHE INTERNAL "")
         target_link_libraries(${prog} PRIVATE ${libs})
         target_include_directories(${prog} PRIVATE ${PROJECT_SOURCE_DIR}/src)
-        if(prog STREQUAL "kalopmxnotify")
-          # The library runs the notification tool from the platform's own
-          # fixed place (under ORVEX_ROOT when that is set).
+        if(prog STREQUAL "kalocontentextractd")
+          # The one program that runs the parsers, in its worker processes.
+          target_link_libraries(${prog} PRIVATE orvex_extract)
+        endif()
+        if(prog STREQUAL "kalopmxnotify" OR prog STREQUAL "kalocontentextractd")
+          # The library runs these tools from the platform's own fixed place
+          # (under ORVEX_ROOT when that is set).
           install(TARGETS ${prog} RUNTIME DESTINATION /usr/kalo/bin)
         else()
           install(TARGETS ${prog} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
@@ -158,13 +180,55 @@ function(orvex_fuzzers)
   endforeach()
 endfunction()
 
+# The install: libfileindex, its headers (with the generated version.h), the
+# CMake package (find_package(Orvex) gives Orvex::fileindex) and fileindex.pc.
+# Both package files find their files relative to where they are installed, so
+# a tree installed under one prefix and moved, or staged with DESTDIR, still
+# works; scripts/check-package depends on that.
 function(orvex_install)
+  include(CMakePackageConfigHelpers)
+  set(cmake_dir ${CMAKE_INSTALL_LIBDIR}/cmake/Orvex)
   install(TARGETS fileindex EXPORT OrvexFileindexTargets
-          LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
-          INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+          LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
   install(DIRECTORY ${PROJECT_SOURCE_DIR}/include/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+  install(FILES ${PROJECT_BINARY_DIR}/include/orvex/version.h
+          DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/orvex)
+
+  install(EXPORT OrvexFileindexTargets NAMESPACE Orvex::
+          FILE OrvexFileindexTargets.cmake DESTINATION ${cmake_dir})
+  configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/OrvexConfig.cmake.in
+                                ${PROJECT_BINARY_DIR}/OrvexConfig.cmake
+                                INSTALL_DESTINATION ${cmake_dir})
+  write_basic_package_version_file(${PROJECT_BINARY_DIR}/OrvexConfigVersion.cmake
+                                   VERSION ${PROJECT_VERSION}
+                                   COMPATIBILITY SameMajorVersion)
+  install(FILES ${PROJECT_BINARY_DIR}/OrvexConfig.cmake
+                ${PROJECT_BINARY_DIR}/OrvexConfigVersion.cmake
+          DESTINATION ${cmake_dir})
+
+  orvex_pkg_config_dirs()
   configure_file(${PROJECT_SOURCE_DIR}/cmake/fileindex.pc.in
                  ${PROJECT_BINARY_DIR}/fileindex.pc @ONLY)
   install(FILES ${PROJECT_BINARY_DIR}/fileindex.pc
           DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
 endfunction()
+
+# The prefix, libdir and includedir lines of fileindex.pc: relative to the .pc
+# file's own directory (${pcfiledir}), which both pkg-config and pkgconf
+# resolve, unless an install directory was given as an absolute path.
+macro(orvex_pkg_config_dirs)
+  if(IS_ABSOLUTE "${CMAKE_INSTALL_LIBDIR}")
+    set(ORVEX_PC_PREFIX "${CMAKE_INSTALL_PREFIX}")
+  else()
+    file(RELATIVE_PATH up "/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/")
+    string(REGEX REPLACE "/$" "" up "${up}")
+    set(ORVEX_PC_PREFIX "\${pcfiledir}/${up}")
+  endif()
+  foreach(kind LIBDIR INCLUDEDIR)
+    if(IS_ABSOLUTE "${CMAKE_INSTALL_${kind}}")
+      set(ORVEX_PC_${kind} "${CMAKE_INSTALL_${kind}}")
+    else()
+      set(ORVEX_PC_${kind} "\${prefix}/${CMAKE_INSTALL_${kind}}")
+    endif()
+  endforeach()
+endmacro()
