@@ -1,0 +1,171 @@
+// The schema and the per-share index commands, as the search daemon
+// stand-in receives them.
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "elastic/elastic_test_root.h"
+#include "orvex/elastic.h"
+#include "orvex/foundation/json.h"
+#include "support/error_code.h"
+
+namespace orvex {
+namespace fileindex {
+namespace elastic {
+namespace {
+
+using testing::CodeOf;
+using testing::Options;
+
+class ShareIndexTest : public testing::ElasticTestRoot {};
+
+// The schema's properties as the search daemon was designed to receive
+// them: type, analyzer ("" where the default applies) and further members.
+struct PropertyRow {
+  const char* name;
+  const char* type;
+  const char* analyzer;
+  const char* others;
+};
+
+const std::vector<PropertyRow>& SchemaRows() {
+  static const std::vector<PropertyRow> rows = {
+      {"KALOMDPath", "", "keyword", R"({"required": true, "_all": false})"},
+      {"KALOMDFSName", "", "keyword", R"({"_all": false})"},
+      {"KALOMDPrivilege", "", "keyword", R"({"_all": false})"},
+      {"KALOMDIsDir", "bool", "", R"({"_all": false})"},
+      {"KALOMDOwnerUserID", "", "keyword", R"({"_all": false})"},
+      {"KALOMDOwnerGroupID", "", "keyword", R"({"_all": false})"},
+      {"KALOMDFSSize", "int", "", "{}"},
+      {"KALOMDFSContentChangeDate", "int", "", "{}"},
+      {"KALOMDAttributeChangeDate", "int", "", "{}"},
+      {"KALOMDFSCreationDate", "int", "", "{}"},
+      {"KALOMDContentModificationDate", "int", "", "{}"},
+      {"KALOMDLastUsedDate", "int", "", "{}"},
+      {"KALOMDContentCreationDate", "int", "", "{}"},
+      {"KALOMDAuthors", "text", "white space", "{}"},
+      {"KALOMDTitle", "text", "", "{}"},
+      {"KALOMDAlbum", "text", "", "{}"},
+      {"KALOMDIdentifier", "text", "keyword", R"({"_all": false})"},
+      {"KALOMDAudioTrackNumber", "int", "", "{}"},
+      {"KALOMDRecordingYear", "int", "", "{}"},
+      {"KALOMDCreator", "text", "white space", "{}"},
+      {"KALOMDMusicalGenre", "text", "", "{}"},
+      {"KALOMDComposer", "text", "white space", "{}"},
+      {"KALOMDComment", "text", "", "{}"},
+      {"KALOMDDurationSecond", "double", "", "{}"},
+      {"KALOMDAudioBitRate", "int", "", "{}"},
+      {"KALOMDTotalBitRate", "int", "", "{}"},
+      {"KALOMDVideoBitRate", "int", "", "{}"},
+      {"KALOMDAudioSampleRate", "int", "", "{}"},
+      {"KALOMDAudioChannelCount", "int", "", "{}"},
+      {"KALOMDISOSpeed", "int", "", "{}"},
+      {"KALOMDCodecs", "text", "white space", "{}"},
+      {"KALOMDDescription", "text", "", "{}"},
+      {"KALOMDAcquisitionMake", "text", "white space", "{}"},
+      {"KALOMDAcquisitionModel", "text", "white space", "{}"},
+      {"KALOMDExposureTimeString", "", "keyword", "{}"},
+      {"KALOMDAperture", "", "keyword", "{}"},
+      {"KALOMDResolutionWidthDPI", "int", "", "{}"},
+      {"KALOMDResolutionHeightDPI", "int", "", "{}"},
+      {"KALOMDMediaTypes", "", "keyword", "{}"},
+      {"KALOMDParent", "", "keyword", R"({"_all": false})"},
+      {"KALOMDExtension", "", "keyword", R"({"_all": false})"},
+      {"KALOMDTextContent", "text", "", "{}"},
+      {"KALOMDKeywords", "", "", "{}"},
+      {"KALOMDFinderLabel", "int", "", "{}"},
+      {"KALOMDGroupId", "", "keyword", "{}"},
+      {"KALOMDFinderOpenDate", "int", "", "{}"},
+      {"KALOMDLogicalSize", "int", "", "{}"},
+      {"KALOMDPhysicalSize", "int", "", "{}"},
+      {"KALOMDDateAdded", "int", "", "{}"},
+      {"KALOMDSearchFileName", "text", "white space", R"({"preprocess": ["tolower", "ngram"]})"},
+      {"KALOMDStarRating", "", "keyword", "{}"},
+      {"_KALOMDUserTags", "text", "", "{}"},
+      {"KALOMDSpotlightBoost", "text", "white space", "{}"},
+  };
+  return rows;
+}
+
+Json::Value ExpectedProperty(const PropertyRow& row) {
+  Json::Value entry = Options(row.others);
+  if (*row.type) entry["type"] = row.type;
+  if (*row.analyzer) entry["analyzer"] = row.analyzer;
+  return entry;
+}
+
+TEST(MappingsTest, HoldsTheDefaultAndEveryPropertyOfTheSchema) {
+  const Json::Value mappings = GetFileIndexMappings();
+  EXPECT_EQ(3u, mappings.size());
+  EXPECT_EQ("KALOMDPath", mappings["property_id"].asString());
+  EXPECT_EQ(Options(R"({"type": "string", "analyzer": "kalostandard", "required": false,
+                        "stored": true, "_all": true})"),
+            mappings["default"]);
+  ASSERT_EQ(53u, SchemaRows().size());
+  EXPECT_EQ(53u, mappings["properties"].size());
+  for (const PropertyRow& row : SchemaRows()) {
+    EXPECT_EQ(ExpectedProperty(row), mappings["properties"][row.name]) << row.name;
+  }
+}
+
+TEST(MappingsTest, IndexIdentifierCarriesTheShareNameUnchanged) {
+  for (const std::string share : {"s", "My Photos", "Фото 2024", "a/b"}) {
+    EXPECT_EQ("fileindex_" + share, GetFileIndexID(share)) << share;
+  }
+}
+
+TEST_F(ShareIndexTest, CreateSendsTheDatabasePathEmptySettingsAndTheSchema) {
+  const std::string root = AddShare("Home Media");
+  ShareIndexCreate("Home Media");
+  ASSERT_EQ(1u, peer_.requests().size());
+  Json::Value expected;
+  expected["command"] = "index_create";
+  expected["data"]["id"] = "fileindex_Home Media";
+  expected["data"]["path"] = root + "/@eaDir/@fileindex/db";
+  expected["data"]["settings"] = Json::Value(Json::objectValue);
+  expected["data"]["mappings"] = GetFileIndexMappings();
+  EXPECT_EQ(expected, peer_.requests()[0]);
+  EXPECT_TRUE(peer_.faults().empty());
+}
+
+TEST_F(ShareIndexTest, CreateOfAnUnknownShareSendsNothing) {
+  std::string reason;
+  EXPECT_EQ(800, CodeOf([] { ShareIndexCreate("nope"); }, &reason));
+  EXPECT_EQ("nope", reason);
+  EXPECT_TRUE(peer_.requests().empty());
+}
+
+TEST_F(ShareIndexTest, EachCommandSendsItsRequest) {
+  struct Case {
+    const char* name;
+    std::function<void()> call;
+    const char* request;
+  };
+  const std::vector<Case> cases = {
+      {"delete", [] { ShareIndexDelete("s"); },
+       R"({"command": "index_delete", "data": {"id": "fileindex_s"}})"},
+      {"pause", [] { ShareIndexPause("s"); },
+       R"({"command": "index_pause", "data": {"id": "fileindex_s"}})"},
+      {"resume", [] { ShareIndexResume("s"); },
+       R"({"command": "index_resume", "data": {"id": "fileindex_s"}})"},
+      {"rename", [] { ShareIndexRename("old s", "new é", "/volume2/new é/@eaDir/@fileindex/db"); },
+       R"({"command": "index_config_set", "data": {"id": "fileindex_old s",
+           "data": {"id": "fileindex_new é", "path": "/volume2/new é/@eaDir/@fileindex/db"}}})"},
+      {"migrate", [] { ShareIndexMigrate("s", "/volume2/s/@eaDir/@fileindex/db"); },
+       R"({"command": "index_config_set", "data": {"id": "fileindex_s",
+           "data": {"path": "/volume2/s/@eaDir/@fileindex/db"}}})"},
+  };
+  for (const Case& c : cases) {
+    const size_t before = peer_.requests().size();
+    c.call();
+    ASSERT_EQ(before + 1, peer_.requests().size()) << c.name;
+    EXPECT_EQ(Options(c.request), peer_.requests().back()) << c.name;
+  }
+}
+
+}  // namespace
+}  // namespace elastic
+}  // namespace fileindex
+}  // namespace orvex
