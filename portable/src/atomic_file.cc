@@ -7,30 +7,11 @@
 #include <atomic>
 #include <cerrno>
 
+#include "orvex/portable/file_descriptor.h"
+
 namespace orvex {
 namespace portable {
 namespace {
-
-// Closes on scope exit; keeps errno of the failure that matters.
-class Fd {
- public:
-  explicit Fd(int fd) : fd_(fd) {}
-  Fd(const Fd&) = delete;
-  Fd& operator=(const Fd&) = delete;
-  ~Fd() { Close(); }
-  int get() const { return fd_; }
-  bool Close() {
-    if (fd_ < 0) return true;
-    int saved = errno;
-    bool ok = ::close(fd_) == 0;
-    if (ok) errno = saved;
-    fd_ = -1;
-    return ok;
-  }
-
- private:
-  int fd_;
-};
 
 bool WriteAll(int fd, const char* data, size_t size) {
   while (size > 0) {
@@ -48,17 +29,40 @@ std::string TempNameFor(const std::string& path) {
   return path + ".tmp-" + std::to_string(::getpid()) + "-" + std::to_string(counter++);
 }
 
+// rename() would put the new file in place of a symbolic link (leaving what
+// it pointed to stale) and fails late, after all the writing, over a
+// directory. Both are somebody's mistake to be reported, not papered over.
+bool TargetReplaceable(const std::string& path) {
+  const int saved = errno;
+  struct stat st;
+  if (::lstat(path.c_str(), &st) != 0) {
+    if (errno != ENOENT) return false;
+    errno = saved;  // a missing target is the normal first save
+    return true;
+  }
+  if (S_ISLNK(st.st_mode)) {
+    errno = ELOOP;
+    return false;
+  }
+  if (S_ISDIR(st.st_mode)) {
+    errno = EISDIR;
+    return false;
+  }
+  return true;
+}
+
 }  // namespace
 
 bool WriteFileAtomic(const std::string& path, const std::string& data, mode_t mode) {
+  if (!TargetReplaceable(path)) return false;
   const std::string tmp = TempNameFor(path);
-  Fd fd(::open(tmp.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode));
-  if (fd.get() < 0) return false;
-  bool ok = WriteAll(fd.get(), data.data(), data.size()) && ::fchmod(fd.get(), mode) == 0 &&
-            ::fsync(fd.get()) == 0 && fd.Close() && ::rename(tmp.c_str(), path.c_str()) == 0;
+  FileDescriptor fd(::open(tmp.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode));
+  if (!fd) return false;
+  const bool ok = WriteAll(fd.get(), data.data(), data.size()) && ::fchmod(fd.get(), mode) == 0 &&
+                  ::fsync(fd.get()) == 0 && fd.Close() && ::rename(tmp.c_str(), path.c_str()) == 0;
   if (!ok) {
-    int saved = errno;
-    fd.Close();
+    fd.reset();  // keeps errno
+    const int saved = errno;
     ::unlink(tmp.c_str());
     errno = saved;
   }
@@ -66,8 +70,8 @@ bool WriteFileAtomic(const std::string& path, const std::string& data, mode_t mo
 }
 
 bool ReadWholeFile(const std::string& path, std::string& data) {
-  Fd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (fd.get() < 0) return false;
+  FileDescriptor fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  if (!fd) return false;
   struct stat st;
   if (::fstat(fd.get(), &st) != 0) return false;
   if (S_ISDIR(st.st_mode)) {

@@ -6,7 +6,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cctype>
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
 #include <functional>
 #include <memory>
@@ -15,7 +17,9 @@
 #include <stdexcept>
 
 #include "orvex/portable/atomic_file.h"
+#include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
+#include "orvex/portable/utf8_text.h"
 
 namespace orvex {
 namespace portable {
@@ -33,10 +37,25 @@ bool* FlagOf(ShareRecord& share, const std::string& key) {
   return nullptr;
 }
 
-std::string Quoted(const std::string& text) { return "\"" + text + "\""; }
+using Kind = ShareRegistryError::Kind;
 
-std::string Errno(const std::string& what, const std::string& path) {
-  return what + " " + path + ": " + std::strerror(errno);
+std::string Hex(unsigned value, int digits) {
+  char text[16];
+  std::snprintf(text, sizeof(text), "%0*X", digits, value);
+  return text;
+}
+
+// The system's message for err, as it reads inside a sentence.
+std::string Cause(int err) {
+  std::string text = std::strerror(err);
+  if (!text.empty()) text[0] = static_cast<char>(std::tolower(static_cast<unsigned char>(text[0])));
+  return text;
+}
+
+// Throws for the system call that just failed; what names the file.
+[[noreturn]] void Fail(Kind kind, const std::string& what) {
+  const int err = errno;
+  throw ShareRegistryError(kind, err, what + ": " + Cause(err));
 }
 
 // Checks a share name; returns what is wrong, or "" when it is fine.
@@ -49,10 +68,29 @@ std::string NameProblem(const std::string& name) {
   return "";
 }
 
+// Names travel in JSON replies, log lines and terminal tables: bytes that
+// are not UTF-8 break the first, control characters garble the others.
+// Checked for new and changed shares only, so that a registry written by
+// hand before stays readable.
+std::string NameTextProblem(const std::string& name) {
+  std::string problem;
+  ForEachCodePoint(name, [&](UChar32 c, size_t begin, size_t) {
+    if (!problem.empty()) return;
+    if (c < 0) {
+      problem = "the name is not valid UTF-8 (byte 0x" +
+                Hex(static_cast<unsigned char>(name[begin]), 2) + " at offset " +
+                std::to_string(begin) + ")";
+    } else if (IsControlCodePoint(c)) {
+      problem = "the name contains the control character U+" + Hex(static_cast<unsigned>(c), 4);
+    }
+  });
+  return problem;
+}
+
 // Drops trailing slashes; returns what is wrong with the path, or "".
 std::string NormalizePath(std::string& path) {
   if (path.empty()) return "the path is empty";
-  if (path.front() != '/') return "the path " + Quoted(path) + " is not absolute";
+  if (path.front() != '/') return "the path " + QuoteForDisplay(path) + " is not absolute";
   while (path.size() > 1 && path.back() == '/') path.pop_back();
   if (path == "/") return "the path is the root directory";
   if (path.size() > kMaxPathBytes) return "the path is longer than 4095 bytes";
@@ -61,7 +99,7 @@ std::string NormalizePath(std::string& path) {
   std::string part;
   while (std::getline(components, part, '/')) {
     if (part.empty() || part == "." || part == "..") {
-      return "the path " + Quoted(path) + " has an empty, \".\" or \"..\" component";
+      return "the path " + QuoteForDisplay(path) + " has an empty, \".\" or \"..\" component";
     }
   }
   return "";
@@ -70,12 +108,12 @@ std::string NormalizePath(std::string& path) {
 std::string PrivilegesProblem(const std::map<std::string, std::string>& privileges) {
   for (const auto& entry : privileges) {
     if (entry.first.empty() || entry.first.size() > kMaxNameBytes) {
-      return "privilege user name " + Quoted(entry.first) + " is empty or too long";
+      return "privilege user name " + QuoteForDisplay(entry.first) + " is empty or too long";
     }
     if (entry.second != kSharePrivReadWrite && entry.second != kSharePrivReadOnly &&
         entry.second != kSharePrivNone) {
-      return "privilege of " + Quoted(entry.first) + " is " + Quoted(entry.second) +
-             ", not \"rw\", \"ro\" or \"na\"";
+      return "privilege of " + QuoteForDisplay(entry.first) + " is " +
+             QuoteForDisplay(entry.second) + ", not \"rw\", \"ro\" or \"na\"";
     }
   }
   return "";
@@ -97,10 +135,12 @@ ShareRecord RecordFromJson(const Json::Value& entry) {
   for (const std::string& key : entry.getMemberNames()) {
     const Json::Value& value = entry[key];
     if (key == "name" || key == "path") {
-      if (!value.isString()) throw std::runtime_error("key " + Quoted(key) + " is not a string");
+      if (!value.isString())
+        throw std::runtime_error("key " + QuoteForDisplay(key) + " is not a string");
       (key == "name" ? share.name : share.path) = value.asString();
     } else if (bool* flag = FlagOf(share, key)) {
-      if (!value.isBool()) throw std::runtime_error("key " + Quoted(key) + " is not a boolean");
+      if (!value.isBool())
+        throw std::runtime_error("key " + QuoteForDisplay(key) + " is not a boolean");
       *flag = value.asBool();
     } else if (key == "ftp_privilege") {
       if (!value.isInt()) throw std::runtime_error("key \"ftp_privilege\" is not an integer");
@@ -109,12 +149,12 @@ ShareRecord RecordFromJson(const Json::Value& entry) {
       if (!value.isObject()) throw std::runtime_error("key \"privileges\" is not an object");
       for (const std::string& user : value.getMemberNames()) {
         if (!value[user].isString()) {
-          throw std::runtime_error("privilege of " + Quoted(user) + " is not a string");
+          throw std::runtime_error("privilege of " + QuoteForDisplay(user) + " is not a string");
         }
         share.privileges[user] = value[user].asString();
       }
     } else {
-      throw std::runtime_error("unknown key " + Quoted(key));
+      throw std::runtime_error("unknown key " + QuoteForDisplay(key));
     }
   }
   if (!entry.isMember("name")) throw std::runtime_error("key \"name\" is missing");
@@ -140,14 +180,31 @@ Json::Value RecordToJson(const ShareRecord& share) {
   return entry;
 }
 
-void MakeParentDirs(const std::string& path) {
+void MakeParentDirs(const std::string& path, Kind kind) {
   for (size_t slash = path.find('/', 1); slash != std::string::npos;
        slash = path.find('/', slash + 1)) {
     std::string dir = path.substr(0, slash);
     if (::mkdir(dir.c_str(), 0755) != 0 && errno != EEXIST) {
-      throw std::runtime_error(Errno("cannot create directory", dir));
+      Fail(kind, "directory " + dir + " cannot be created");
     }
   }
+}
+
+// The registry must be the file itself. Returns false when it does not
+// exist (no shares); throws for a link, a directory or a failed lstat.
+bool RegistryFileExists(const std::string& path) {
+  struct stat st;
+  if (::lstat(path.c_str(), &st) != 0) {
+    if (errno == ENOENT) return false;
+    Fail(Kind::kLoad, path + " cannot be examined");
+  }
+  if (S_ISLNK(st.st_mode)) {
+    throw ShareRegistryError(Kind::kLoad, ELOOP, path + " is a symbolic link");
+  }
+  if (S_ISDIR(st.st_mode)) {
+    throw ShareRegistryError(Kind::kLoad, EISDIR, path + " is a directory");
+  }
+  return true;
 }
 
 // The writers' exclusive lock, held for its lifetime. flock locks belong to
@@ -155,40 +212,37 @@ void MakeParentDirs(const std::string& path) {
 // too.
 class RegistryLock {
  public:
-  RegistryLock() : path_(RootPath(kShareRegistryLockPath)) {
-    MakeParentDirs(path_);
-    fd_ = ::open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
-    if (fd_ < 0) throw std::runtime_error(Errno("cannot open lock file", path_));
+  RegistryLock() {
+    const std::string path = RootPath(kShareRegistryLockPath);
+    MakeParentDirs(path, Kind::kLock);
+    fd_.reset(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
+    if (!fd_) Fail(Kind::kLock, "lock file " + path + " cannot be opened");
     int rc;
     do {
-      rc = ::flock(fd_, LOCK_EX);
+      rc = ::flock(fd_.get(), LOCK_EX);
     } while (rc != 0 && errno == EINTR);
-    if (rc != 0) {
-      std::string reason = Errno("cannot lock", path_);
-      ::close(fd_);
-      throw std::runtime_error(reason);
-    }
+    if (rc != 0) Fail(Kind::kLock, "lock file " + path + " cannot be locked");
   }
-  RegistryLock(const RegistryLock&) = delete;
-  RegistryLock& operator=(const RegistryLock&) = delete;
-  ~RegistryLock() { ::close(fd_); }  // closing releases the lock
 
  private:
-  std::string path_;
-  int fd_ = -1;
+  FileDescriptor fd_;  // closing releases the lock
 };
+
+void Save(const std::vector<ShareRecord>& shares) {
+  const std::string path = RootPath(kShareRegistryPath);
+  MakeParentDirs(path, Kind::kSave);
+  if (WriteFileAtomic(path, FormatShareRegistry(shares), 0644)) return;
+  if (errno == ELOOP) throw ShareRegistryError(Kind::kSave, ELOOP, path + " is a symbolic link");
+  if (errno == EISDIR) throw ShareRegistryError(Kind::kSave, EISDIR, path + " is a directory");
+  Fail(Kind::kSave, path + " cannot be written");
+}
 
 // Loads, changes and saves the registry under the writers' lock. change
 // returns false to leave the file as it is.
 void Modify(const std::function<bool(std::vector<ShareRecord>&)>& change) {
   RegistryLock lock;
   std::vector<ShareRecord> shares = LoadShares();
-  if (!change(shares)) return;
-  const std::string path = RootPath(kShareRegistryPath);
-  MakeParentDirs(path);
-  if (!WriteFileAtomic(path, FormatShareRegistry(shares), 0644)) {
-    throw std::runtime_error(Errno("cannot write", path));
-  }
+  if (change(shares)) Save(shares);
 }
 
 std::vector<ShareRecord>::iterator FindIn(std::vector<ShareRecord>& shares,
@@ -201,8 +255,9 @@ std::vector<ShareRecord>::iterator FindIn(std::vector<ShareRecord>& shares,
 ShareRecord ValidCopy(const ShareRecord& share) {
   ShareRecord copy = share;
   std::string problem = RecordProblem(copy);
+  if (problem.empty()) problem = NameTextProblem(copy.name);
   if (!problem.empty()) {
-    throw std::invalid_argument("share " + Quoted(share.name) + ": " + problem);
+    throw std::invalid_argument("share " + QuoteForDisplay(share.name) + ": " + problem);
   }
   return copy;
 }
@@ -217,9 +272,11 @@ std::vector<ShareRecord> ParseShareRegistry(const std::string& text, const std::
   std::string errors;
   if (!reader->parse(text.data(), text.data() + text.size(), &root, &errors)) {
     while (!errors.empty() && errors.back() == '\n') errors.pop_back();
-    throw std::runtime_error(source + ": not valid JSON: " + errors);
+    throw ShareRegistryError(Kind::kLoad, 0, source + ": not valid JSON: " + errors);
   }
-  if (!root.isArray()) throw std::runtime_error(source + ": not a JSON array of shares");
+  if (!root.isArray()) {
+    throw ShareRegistryError(Kind::kLoad, 0, source + ": not a JSON array of shares");
+  }
   std::vector<ShareRecord> shares;
   std::set<std::string> names;
   for (Json::ArrayIndex i = 0; i < root.size(); ++i) {
@@ -227,10 +284,11 @@ std::vector<ShareRecord> ParseShareRegistry(const std::string& text, const std::
     try {
       shares.push_back(RecordFromJson(root[i]));
     } catch (const std::runtime_error& e) {
-      throw std::runtime_error(where + ": " + e.what());
+      throw ShareRegistryError(Kind::kLoad, 0, where + ": " + e.what());
     }
     if (!names.insert(shares.back().name).second) {
-      throw std::runtime_error(where + ": duplicate name " + Quoted(shares.back().name));
+      throw ShareRegistryError(Kind::kLoad, 0,
+                               where + ": duplicate name " + QuoteForDisplay(shares.back().name));
     }
   }
   return shares;
@@ -247,10 +305,11 @@ std::string FormatShareRegistry(const std::vector<ShareRecord>& shares) {
 
 std::vector<ShareRecord> LoadShares() {
   const std::string path = RootPath(kShareRegistryPath);
+  if (!RegistryFileExists(path)) return {};
   std::string text;
   if (!ReadWholeFile(path, text)) {
-    if (errno == ENOENT) return {};
-    throw std::runtime_error(Errno("cannot read", path));
+    if (errno == ENOENT) return {};  // removed since the lstat
+    Fail(Kind::kLoad, path + " cannot be read");
   }
   return ParseShareRegistry(text, path);
 }
@@ -263,11 +322,12 @@ bool FindShare(const std::string& name, ShareRecord& out) {
   return true;
 }
 
-void AddShare(const ShareRecord& share) {
+void AddShare(const ShareRecord& share, const ShareAddCheck& check) {
   ShareRecord valid = ValidCopy(share);
-  Modify([&valid](std::vector<ShareRecord>& shares) {
+  Modify([&valid, &check](std::vector<ShareRecord>& shares) {
+    if (check) check(shares, valid);
     if (FindIn(shares, valid.name) != shares.end()) {
-      throw std::invalid_argument("share " + Quoted(valid.name) + " exists already");
+      throw std::invalid_argument("share " + QuoteForDisplay(valid.name) + " exists already");
     }
     shares.push_back(valid);
     return true;
@@ -279,7 +339,7 @@ void UpdateShare(const ShareRecord& share) {
   Modify([&valid](std::vector<ShareRecord>& shares) {
     auto it = FindIn(shares, valid.name);
     if (it == shares.end()) {
-      throw std::invalid_argument("no share called " + Quoted(valid.name));
+      throw std::invalid_argument("no share called " + QuoteForDisplay(valid.name));
     }
     *it = valid;
     return true;

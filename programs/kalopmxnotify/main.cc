@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <ctime>
 #include <iostream>
@@ -19,7 +20,10 @@
 #include <vector>
 
 #include "orvex/foundation/json.h"
+#include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
+#include "orvex/portable/utf8_text.h"
+#include "orvex/version.h"
 
 namespace {
 
@@ -30,17 +34,20 @@ constexpr char kNotificationsDir[] = "/var/lib/orvex";
 constexpr char kNotificationsPath[] = "/var/lib/orvex/notifications.jsonl";
 
 constexpr char kUsage[] =
-    "usage: kalopmxnotify -c APP [-b BOOL] [-e BOOL] TARGET KEY... [LINK_OPEN LINK_CLOSE]\n"
+    "usage: kalopmxnotify -c APP [-b BOOL] [-e BOOL] [--] TARGET KEY... [LINK_OPEN LINK_CLOSE]\n"
     "Sends a desktop notification from application APP to TARGET (a group such as\n"
     "@administrators, or a user). Each KEY is a string key the desktop resolves\n"
     "to text (\"app:displayname\", \"error:index_no_space\"); an optional pair of\n"
     "link tags (an opening \"<a ...>\" and a closing \"</a>\") wraps a link.\n"
-    "  -c APP   the sending application (required)\n"
-    "  -b BOOL  flag b, \"true\" or \"false\"\n"
-    "  -e BOOL  flag e, \"true\" or \"false\"\n"
-    "  --help   print this help\n"
+    "  -c APP     the sending application (required)\n"
+    "  -b BOOL    flag b, \"true\" or \"false\"\n"
+    "  -e BOOL    flag e, \"true\" or \"false\"\n"
+    "  --         ends the options (for a TARGET that begins with \"-\")\n"
+    "  --help     print this help\n"
+    "  --version  print the version\n"
     "The notification is written to the system log and appended to\n"
-    "/var/lib/orvex/notifications.jsonl (under ORVEX_ROOT when set).\n"
+    "/var/lib/orvex/notifications.jsonl (under ORVEX_ROOT when set). Bytes of the\n"
+    "arguments that are not UTF-8 are recorded as U+FFFD, the replacement character.\n"
     "Exit status: 0 on success, 1 when it cannot be recorded, 2 for bad usage.\n";
 
 struct Notification {
@@ -53,6 +60,8 @@ struct Notification {
 };
 
 bool IsLinkTag(const std::string& arg) { return !arg.empty() && arg[0] == '<'; }
+bool IsOptionWord(const std::string& arg) { return arg.size() > 1 && arg[0] == '-'; }
+
 bool IsClosingTag(const std::string& arg) { return arg.compare(0, 2, "</") == 0; }
 
 int UsageError(const std::string& why) {
@@ -60,24 +69,44 @@ int UsageError(const std::string& why) {
   return kExitUsage;
 }
 
-// Reads "-c APP", "-b BOOL", "-e BOOL" from argv[i...]; i is left at the
-// first argument that is not an option. Returns -1 to go on, else the exit
-// status.
+// "--help" and "--version" print and end the run with status 0; -1 for any
+// other word.
+int InfoOption(const std::string& option) {
+  if (option == "--help") {
+    std::cout << kUsage;
+    return 0;
+  }
+  if (option == "--version") {
+    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
+    return 0;
+  }
+  return -1;
+}
+
+// Reads "-c APP", "-b BOOL", "-e BOOL" (and "--help", "--version", "--")
+// from args[i...]; i is left at the first argument that is not an option.
+// Returns -1 to go on, else the exit status.
 int ParseOptions(const std::vector<std::string>& args, size_t& i, Notification& n) {
-  for (; i < args.size() && args[i].size() == 2 && args[i][0] == '-'; i += 2) {
+  for (; i < args.size() && IsOptionWord(args[i]); i += 2) {
     const std::string& option = args[i];
+    if (option == "--") {
+      ++i;
+      break;
+    }
+    if (InfoOption(option) >= 0) return 0;
+    if (option != "-c" && option != "-b" && option != "-e") {
+      return UsageError("unknown option " + option);
+    }
     if (i + 1 >= args.size()) return UsageError("option " + option + " needs a value");
     const std::string& value = args[i + 1];
     if (option == "-c") {
       if (value.empty()) return UsageError("empty application name");
       n.app = value;
-    } else if (option == "-b" || option == "-e") {
+    } else {
       if (value != "true" && value != "false") {
         return UsageError("option " + option + " takes true or false, not \"" + value + "\"");
       }
       n.flags[option.substr(1)] = value == "true";
-    } else {
-      return UsageError("unknown option " + option);
     }
   }
   if (n.app.empty()) return UsageError("missing -c APP");
@@ -105,11 +134,11 @@ int ParsePositionals(const std::vector<std::string>& args, size_t i, Notificatio
 }
 
 int ParseArgs(int argc, char** argv, Notification& n) {
-  const std::vector<std::string> args(argv + 1, argv + argc);
-  if (!args.empty() && args[0] == "--help") {
-    std::cout << kUsage;
-    return 0;
-  }
+  std::vector<std::string> args;
+  // The notifications file is UTF-8 read by a web page, which would reject
+  // a line with stray bytes, and the arguments come from whatever runs the
+  // tool: each ill-formed sequence becomes one U+FFFD.
+  for (int i = 1; i < argc; ++i) args.push_back(orvex::portable::ToValidUtf8(argv[i]));
   size_t i = 0;
   const int status = ParseOptions(args, i, n);
   if (status >= 0) return status;
@@ -145,18 +174,17 @@ bool MakeDirs(const std::string& dir) {
 // Appends line under an exclusive flock, so that notifications sent at the
 // same time never interleave; one write of the whole line.
 bool AppendLine(const std::string& path, const std::string& line) {
-  const int fd = ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
-  if (fd < 0) return false;
-  bool ok = ::flock(fd, LOCK_EX) == 0;
+  // Closing releases the lock; the descriptor keeps errno when it closes.
+  const orvex::FileDescriptor fd(
+      ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
+  if (!fd) return false;
+  bool ok = ::flock(fd.get(), LOCK_EX) == 0;
   for (size_t done = 0; ok && done < line.size();) {
-    const ssize_t n = ::write(fd, line.data() + done, line.size() - done);
+    const ssize_t n = ::write(fd.get(), line.data() + done, line.size() - done);
     if (n < 0 && errno == EINTR) continue;
     ok = n > 0;
     if (ok) done += static_cast<size_t>(n);
   }
-  const int saved = errno;
-  ::close(fd);  // releases the lock
-  errno = saved;
   return ok;
 }
 

@@ -1,6 +1,8 @@
 // What the orvex tool's command groups share: the group entry points listed
 // in main.cc's command table, the usage error, and the small argument parser.
-// The tool is single-threaded.
+// Every failure reaches the administrator as one line,
+// "orvex: error CODE: REASON", where REASON names what is at fault, why, and
+// what to do about it. The tool is single-threaded.
 #ifndef ORVEX_PROGRAMS_ORVEX_COMMAND_LINE_H_
 #define ORVEX_PROGRAMS_ORVEX_COMMAND_LINE_H_
 
@@ -17,8 +19,8 @@ constexpr int kExitFailure = 2;
 
 using Args = std::vector<std::string>;
 
-// Bad usage of a command: main prints "orvex: <message>", then usage, to
-// standard error and exits with kExitFailure.
+// Bad usage of a command: main prints "orvex: error 120: <message>", then
+// usage, to standard error and exits with kExitFailure.
 class UsageError : public std::runtime_error {
  public:
   UsageError(const std::string& message, std::string usage)
@@ -47,7 +49,8 @@ struct Subcommand {
 };
 
 // Runs the subcommand that args[0] names; "--help" there prints usage.
-// Throws UsageError (carrying usage) for a missing or unknown subcommand.
+// Throws UsageError (carrying usage) for a missing or unknown subcommand,
+// naming the subcommands there are.
 int RunSubcommand(const Args& args, const std::string& group,
                   const std::vector<Subcommand>& subcommands, const std::string& usage);
 
@@ -57,6 +60,8 @@ int RunStatusCommand(const Args& args);  // status_commands.cc
 int RunPauseCommand(const Args& args);   // status_commands.cc
 int RunResumeCommand(const Args& args);  // status_commands.cc
 int RunFolderCommand(const Args& args);  // folder_commands.cc
+
+int RunExtractCommand(const Args& args);  // extract_commands.cc
 
 // Arguments split into options ("--name") and positional words. "--" ends
 // the options; a word such as "-2" is positional, so that numbers may be
@@ -71,11 +76,16 @@ struct ParsedArgs {
 // True when args hold "--help" before any "--".
 bool WantsHelp(const Args& args);
 
-// Parses args, allowing only the given options and between min_positional and
-// max_positional positional words. Throws UsageError (carrying usage)
-// otherwise.
-ParsedArgs ParseArgs(const Args& args, const std::set<std::string>& allowed, size_t min_positional,
-                     size_t max_positional, const std::string& usage);
+// Parses args, allowing only the given options and the positional words
+// named in positional (as the usage names them, "NAME", "PATH"), of which
+// the first `required` must be given. Throws UsageError (carrying usage) for
+// an unknown option, a missing or an unexpected word, naming it.
+ParsedArgs ParseArgs(const Args& args, const std::set<std::string>& allowed,
+                     const std::vector<std::string>& positional, size_t required,
+                     const std::string& usage);
+
+// reason, then "; " and next_step when there is one.
+std::string WithNextStep(const std::string& reason, const std::string& next_step);
 
 }  // namespace orvex_cli
 

@@ -3,6 +3,7 @@
 // is taken, as for the web API's list and get.
 #include <algorithm>
 #include <climits>
+#include <functional>
 #include <iostream>
 #include <memory>
 #include <optional>
@@ -13,6 +14,9 @@
 #include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
+#include "orvex/portable/share_registry.h"
+#include "state_files.h"
+#include "terminal_text.h"
 
 namespace orvex_cli {
 namespace {
@@ -33,7 +37,8 @@ constexpr char kListUsage[] =
     "  --offset N    skip the first N folders of the sorted list (default 0)\n"
     "  --limit N     show at most N folders (default all; 0 shows none, only the total)\n"
     "  --sort-by KEY path (default), name, or document, audio, video, photo (folders\n"
-    "                with the type off first); text sorts ignore letter case\n"
+    "                with the type off first); text sorts ignore letter case; any\n"
+    "                other KEY is refused\n"
     "  --desc        reverse the order\n"
     "  --status      add each folder's indexing status (reads the share queues)\n"
     "  --json        print the reply {\"folder\": [...], \"total\": N, \"offset\": N}\n";
@@ -44,6 +49,19 @@ constexpr char kGetUsage[] =
     "/photo/2024. Fails with error 902 when there is none.\n"
     "  --json  print the folder's record as stored\n";
 
+// The keys --sort-by accepts. The library sorts any other word by name; the
+// tool refuses it instead, so that a misspelt key does not quietly sort by
+// something else.
+const std::vector<std::string> kSortKeys = {"path", "name", "document", "audio", "video", "photo"};
+
+std::string SortKey(const std::optional<std::string>& given) {
+  if (!given) return "path";
+  if (std::find(kSortKeys.begin(), kSortKeys.end(), *given) != kSortKeys.end()) return *given;
+  std::string keys;
+  for (const std::string& key : kSortKeys) keys += (keys.empty() ? "" : ", ") + key;
+  throw UsageError("unknown sort key " + Quote(*given) + "; use one of: " + keys, kListUsage);
+}
+
 // Removes "--name VALUE" or "--name=VALUE" from args (before any "--") and
 // returns VALUE; the last one given wins.
 std::optional<std::string> TakeValueOption(Args& args, const std::string& name,
@@ -51,7 +69,7 @@ std::optional<std::string> TakeValueOption(Args& args, const std::string& name,
   std::optional<std::string> value;
   for (size_t i = 0; i < args.size() && args[i] != "--";) {
     if (args[i] == name) {
-      if (i + 1 >= args.size()) throw UsageError("missing value for " + name, usage);
+      if (i + 1 >= args.size()) throw UsageError("missing value after " + name, usage);
       value = args[i + 1];
       args.erase(args.begin() + i, args.begin() + i + 2);
     } else if (args[i].rfind(name + "=", 0) == 0) {
@@ -71,11 +89,33 @@ unsigned int ParseCount(const std::optional<std::string>& text, unsigned int fal
       !text->empty() && text->size() <= 10 &&
       std::all_of(text->begin(), text->end(), [](char c) { return c >= '0' && c <= '9'; });
   if (!digits || std::stoull(*text) > UINT_MAX) {
-    throw UsageError(
-        name + " must be a whole number from 0 to " + std::to_string(UINT_MAX) + ": " + *text,
-        kListUsage);
+    throw UsageError(name + " must be a whole number from 0 to " + std::to_string(UINT_MAX) +
+                         ", not " + Quote(*text),
+                     kListUsage);
   }
   return static_cast<unsigned int>(std::stoull(*text));
+}
+
+// Runs body, which reads the folder list and, for --status, the status
+// file, the share registry and the share queues, explaining what fails.
+void ReadingFolders(const std::function<void()>& body) {
+  try {
+    ExplainStateFileErrors({FoldersFile(), StatusFile()}, "", body);
+  } catch (const orvex::Error& e) {
+    // The registry's failures reach the library as one platform error among
+    // others; whether the registry is at fault is seen by reading it.
+    if (e.code() != orvex::kErrorSystem) throw;
+    try {
+      orvex::portable::LoadShares();
+    } catch (const orvex::portable::ShareRegistryError& broken) {
+      const std::string next_step =
+          broken.error_number() == 0
+              ? "correct the share registry by hand (its format is in doc/share_registry.md)"
+              : NextStep(broken.error_number());
+      throw orvex::Error(e.code(), WithNextStep(e.reason(), next_step));
+    }
+    throw;
+  }
 }
 
 // The web API's folder list reply: one page with each folder's record and
@@ -93,17 +133,6 @@ Json::Value ListReply(unsigned int offset, unsigned int limit, const std::string
   for (const auto& folder : folders)
     out["folder"].append(folder->GetDataWithAdditional(additional));
   return out;
-}
-
-// Terminal columns of UTF-8 text, counting each code point as one.
-size_t Columns(const std::string& text) {
-  return std::count_if(text.begin(), text.end(),
-                       [](char c) { return (static_cast<unsigned char>(c) & 0xC0) != 0x80; });
-}
-
-std::string Pad(const std::string& text, size_t width) {
-  const size_t columns = Columns(text);
-  return columns >= width ? text : text + std::string(width - columns, ' ');
 }
 
 std::string YesNo(const Json::Value& flag) { return flag.asBool() ? "yes" : "no"; }
@@ -136,17 +165,7 @@ void PrintTable(const Json::Value& reply, bool with_status) {
                     YesNo(folder["paused"])});
     if (with_status) rows.back().push_back(StatusText(folder));
   }
-  std::vector<size_t> widths(rows[0].size(), 0);
-  for (const auto& row : rows) {
-    for (size_t i = 0; i < row.size(); ++i) widths[i] = std::max(widths[i], Columns(row[i]));
-  }
-  for (const auto& row : rows) {
-    std::string line;
-    for (size_t i = 0; i < row.size(); ++i) {
-      line += i + 1 == row.size() ? row[i] : Pad(row[i], widths[i]) + "  ";
-    }
-    std::cout << line << "\n";
-  }
+  std::cout << FormatTable(rows);
   if (folders.size() != total) {
     std::cout << "showing " << folders.size() << " of " << total << " folders from offset "
               << offset << "\n";
@@ -163,12 +182,14 @@ int List(const Args& args) {
       ParseCount(TakeValueOption(rest, "--offset", kListUsage), 0, "--offset");
   const unsigned int limit =
       ParseCount(TakeValueOption(rest, "--limit", kListUsage), UINT_MAX, "--limit");
-  const std::string sort_by = TakeValueOption(rest, "--sort-by", kListUsage).value_or("path");
-  const ParsedArgs parsed = ParseArgs(rest, {"--desc", "--status", "--json"}, 0, 0, kListUsage);
+  const std::string sort_by = SortKey(TakeValueOption(rest, "--sort-by", kListUsage));
+  const ParsedArgs parsed = ParseArgs(rest, {"--desc", "--status", "--json"}, {}, 0, kListUsage);
   Json::Value additional(Json::arrayValue);
   if (parsed.Has("--status")) additional.append("status");
-  const Json::Value reply =
-      ListReply(offset, limit, sort_by, parsed.Has("--desc") ? "desc" : "asc", additional);
+  Json::Value reply;
+  ReadingFolders([&] {
+    reply = ListReply(offset, limit, sort_by, parsed.Has("--desc") ? "desc" : "asc", additional);
+  });
   if (parsed.Has("--json")) {
     std::cout << orvex::toString(reply) << "\n";
   } else {
@@ -182,11 +203,23 @@ int Get(const Args& args) {
     std::cout << kGetUsage;
     return kExitOk;
   }
-  const ParsedArgs parsed = ParseArgs(args, {"--json"}, 1, 1, kGetUsage);
-  const FolderMgr mgr;
-  std::shared_ptr<Folder> folder;
-  mgr.Get(folder, parsed.positional[0]);
-  const Json::Value data = folder->GetData();
+  const ParsedArgs parsed = ParseArgs(args, {"--json"}, {"PATH"}, 1, kGetUsage);
+  const std::string& path = parsed.positional[0];
+  Json::Value data;
+  ReadingFolders([&] {
+    const FolderMgr mgr;
+    std::shared_ptr<Folder> folder;
+    try {
+      mgr.Get(folder, path);
+    } catch (const orvex::Error& e) {
+      if (e.code() != orvex::kErrorNoFolder) throw;
+      throw orvex::Error(e.code(), e.reason() +
+                                       " is not an indexed folder (the path must match "
+                                       "exactly, letter case and slashes included); "
+                                       "see them all: orvex folder list");
+    }
+    data = folder->GetData();
+  });
   if (parsed.Has("--json")) {
     std::cout << orvex::toString(data) << "\n";
     return kExitOk;

@@ -3,10 +3,13 @@
 // (telling the indexing daemon at once). Fixed paths follow ORVEX_ROOT like
 // everything else in the system.
 #include <iostream>
+#include <new>
 #include <string>
 
 #include "command_line.h"
 #include "orvex/foundation/error.h"
+#include "orvex/version.h"
+#include "terminal_text.h"
 
 namespace orvex_cli {
 namespace {
@@ -26,6 +29,7 @@ const CommandGroup kCommands[] = {
     {"pause", "pause indexing for HOURS hours, or with no end", RunPauseCommand},
     {"resume", "resume indexing", RunResumeCommand},
     {"folder", "list the indexed folders or show one", RunFolderCommand},
+    {"extract", "show what content extraction gives for files", RunExtractCommand},
 };
 
 std::string Usage() {
@@ -39,9 +43,11 @@ std::string Usage() {
     usage += "  " + name + "  " + group.summary + "\n";
   }
   usage +=
+      "Options: --help (also after any command), --version.\n"
       "Fixed paths (share registry, status file, daemon socket) are taken under\n"
       "$ORVEX_ROOT when it is set.\n"
-      "Exit status: 0 on success, 2 on any failure or bad usage.\n";
+      "Exit status: 0 on success, 2 on any failure or bad usage, which is reported\n"
+      "as \"orvex: error CODE: REASON\" (code 120 for bad usage, followed by the usage).\n";
   return usage;
 }
 
@@ -58,21 +64,37 @@ int Dispatch(const Args& args) {
     std::cout << Usage();
     return kExitOk;
   }
+  if (args[0] == "--version") {
+    std::cout << "orvex " << ORVEX_VERSION << "\n";
+    return kExitOk;
+  }
   const CommandGroup* group = FindGroup(args[0]);
-  if (group == nullptr) throw UsageError("unknown command " + args[0], Usage());
+  if (group == nullptr) {
+    const bool option = args[0].size() > 1 && args[0][0] == '-';
+    throw UsageError((option ? "unknown option " : "unknown command ") + Quote(args[0]), Usage());
+  }
   return group->run(Args(args.begin() + 1, args.end()));
 }
 
-// Exceptions stop here: each becomes one line on standard error.
+void PrintError(int code, const std::string& reason) {
+  std::cerr << "orvex: error " << code << ": " << reason << "\n";
+}
+
+// Exceptions stop here: each becomes one "orvex: error CODE: REASON" line on
+// standard error. The commands put what, where, why and what to do into the
+// reasons; what reaches this far unexplained is at least named.
 int Main(const Args& args) {
   try {
     return Dispatch(args);
   } catch (const UsageError& e) {
-    std::cerr << "orvex: " << e.what() << "\n" << e.usage();
+    PrintError(orvex::kErrorBadArgument, e.what());
+    std::cerr << e.usage();
   } catch (const orvex::Error& e) {
-    std::cerr << "orvex: error " << e.code() << ": " << e.reason() << "\n";
+    PrintError(e.code(), e.reason());
+  } catch (const std::bad_alloc&) {
+    PrintError(orvex::kErrorSystem, "out of memory");
   } catch (const std::exception& e) {
-    std::cerr << "orvex: " << e.what() << "\n";
+    PrintError(orvex::kErrorSystem, e.what());
   }
   return kExitFailure;
 }

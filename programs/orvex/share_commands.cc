@@ -1,20 +1,30 @@
 // `orvex share add|list|remove`: the share registry through the portable
 // platform's API, which validates, locks and writes the file atomically.
-#include <algorithm>
+// The tool adds its own rules for new shares: the root directory must exist
+// and no two shares may overlap, since every file must belong to exactly
+// one share's index.
+#include <sys/stat.h>
+
+#include <cerrno>
 #include <cstdlib>
 #include <iostream>
 #include <memory>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
 #include "command_line.h"
+#include "foundation/path_prefix.h"
 #include "orvex/foundation/error.h"
+#include "orvex/portable/root.h"
 #include "orvex/portable/share_registry.h"
+#include "terminal_text.h"
 
 namespace orvex_cli {
 namespace {
 
 using orvex::portable::ShareRecord;
+using orvex::portable::ShareRegistryError;
 
 constexpr char kShareUsage[] =
     "usage: orvex share add NAME PATH [--readonly] [--encryption] [--recycle-bin]\n"
@@ -27,13 +37,15 @@ constexpr char kShareUsage[] =
 constexpr char kAddUsage[] =
     "usage: orvex share add NAME PATH [--readonly] [--encryption] [--recycle-bin]\n"
     "                       [--hide-unreadable]\n"
-    "Registers the share NAME (exact case, no \"/\") whose root directory is PATH.\n"
-    "A relative PATH is taken from the current directory and must exist.\n"
-    "  --readonly         the share is read-only\n"
+    "Registers the share NAME (exact case; UTF-8 without \"/\" or control characters)\n"
+    "whose root directory is PATH. PATH must be an existing directory; a relative\n"
+    "PATH is taken from the current directory. PATH may not be the path of another\n"
+    "share, lie inside one, or contain one.\n"
+    "  --readonly         the share is read-only (read-only shares are never indexed)\n"
     "  --encryption       the share is of the encrypted kind\n"
     "  --recycle-bin      the share keeps a recycle bin at PATH/#recycle\n"
     "  --hide-unreadable  users do not see entries they cannot read\n"
-    "Fails when a share of that name exists.\n";
+    "Fails (error 120) when a share of that name exists.\n";
 
 constexpr char kListUsage[] =
     "usage: orvex share list [--json]\n"
@@ -45,14 +57,116 @@ constexpr char kRemoveUsage[] =
     "Removes the share NAME from the registry (its files are not touched).\n"
     "Fails with error 800 when no share has that name.\n";
 
+std::string RegistryPath() {
+  return orvex::portable::RootPath(orvex::portable::kShareRegistryPath);
+}
+
+// The registry's failures as the tool's errors: the code says which step
+// failed, the reason what is wrong and what to do.
+[[noreturn]] void ThrowRegistryError(const ShareRegistryError& e) {
+  using Kind = ShareRegistryError::Kind;
+  const orvex::ErrorCode code = e.kind() == Kind::kLoad   ? orvex::kErrorLoadJson
+                                : e.kind() == Kind::kLock ? orvex::kErrorLockFile
+                                                          : orvex::kErrorSaveJson;
+  std::string next_step = NextStep(e.error_number());
+  if (e.error_number() == 0) {
+    next_step = "correct the file by hand (its format is described in doc/share_registry.md)";
+  }
+  throw orvex::Error(code, WithNextStep(std::string("share registry: ") + e.what(), next_step));
+}
+
+// Runs a registry call, turning its exceptions into the tool's errors.
+template <typename Call>
+auto WithRegistry(Call call) -> decltype(call()) {
+  try {
+    return call();
+  } catch (const ShareRegistryError& e) {
+    ThrowRegistryError(e);
+  } catch (const std::invalid_argument& e) {
+    throw orvex::Error(orvex::kErrorBadArgument, e.what());
+  }
+}
+
 // A share's root is absolute in the registry; a relative one given here is
 // resolved against the current directory.
 std::string AbsoluteSharePath(const std::string& path) {
   if (!path.empty() && path[0] == '/') return path;
   std::unique_ptr<char, decltype(&std::free)> resolved(::realpath(path.c_str(), nullptr),
                                                        &std::free);
-  if (!resolved) throw std::runtime_error("cannot resolve share path " + path);
+  if (!resolved) {
+    const int err = errno;
+    throw orvex::Error(
+        orvex::kErrorBadArgument,
+        WithNextStep("share path " + Quote(path) + " cannot be resolved: " + Cause(err),
+                     err == ENOENT ? "create the directory first" : NextStep(err)));
+  }
   return resolved.get();
+}
+
+// The root must be there now: a share whose directory is missing could
+// never be indexed and would only fail later, far from this command.
+void CheckRootDirectory(const std::string& path) {
+  struct stat st;
+  if (::stat(path.c_str(), &st) != 0) {
+    const int err = errno;
+    if (err == ENOENT || err == ENOTDIR) {
+      throw orvex::Error(orvex::kErrorBadArgument,
+                         "share path " + path + " does not exist" +
+                             (err == ENOTDIR ? " (a component of it is not a directory)" : "") +
+                             "; create the directory first, or give the share's existing root");
+    }
+    throw orvex::Error(
+        orvex::kErrorBadArgument,
+        WithNextStep("share path " + path + " cannot be examined: " + Cause(err), NextStep(err)));
+  }
+  if (!S_ISDIR(st.st_mode)) {
+    throw orvex::Error(orvex::kErrorBadArgument,
+                       "share path " + path + " is not a directory; a share's root is a directory");
+  }
+}
+
+// path with symbolic links followed, or path itself when it cannot be.
+std::string Canonical(const std::string& path) {
+  std::unique_ptr<char, decltype(&std::free)> resolved(::realpath(path.c_str(), nullptr),
+                                                       &std::free);
+  return resolved ? resolved.get() : path;
+}
+
+// How path relates to other (a registered share's path): "" when they do
+// not overlap.
+std::string Overlap(const std::string& path, const std::string& other) {
+  if (path == other) return "is already the path of";
+  if (orvex::IsSameOrBelow(path, other)) return "lies inside";
+  if (orvex::IsSameOrBelow(other, path)) return "contains";
+  return "";
+}
+
+// Runs under the registry's lock (AddShare), after the registry has checked
+// the name and the path's form, so that two adds at once cannot both pass:
+// each file must belong to exactly one share, and a name must not be taken
+// twice.
+void CheckNewShare(const std::vector<ShareRecord>& shares, const ShareRecord& share) {
+  CheckRootDirectory(share.path);
+  const std::string canonical = Canonical(share.path);
+  for (const ShareRecord& other : shares) {
+    if (other.name == share.name) {
+      throw orvex::Error(orvex::kErrorBadArgument,
+                         "share " + Quote(share.name) + " exists already, at " + other.path +
+                             "; pick another name, or remove it first: orvex share remove " +
+                             other.name);
+    }
+    std::string how = Overlap(share.path, other.path);
+    std::string through_links;
+    if (how.empty()) {
+      how = Overlap(canonical, Canonical(other.path));
+      if (!how.empty()) through_links = " once symbolic links are followed";
+    }
+    if (how.empty()) continue;
+    throw orvex::Error(orvex::kErrorBadArgument,
+                       "share path " + share.path + " " + how + " share " + Quote(other.name) +
+                           " (" + other.path + ")" + through_links +
+                           "; shares may not overlap: pick a directory outside every other share");
+  }
 }
 
 int Add(const Args& args) {
@@ -60,8 +174,9 @@ int Add(const Args& args) {
     std::cout << kAddUsage;
     return kExitOk;
   }
-  const ParsedArgs parsed = ParseArgs(
-      args, {"--readonly", "--encryption", "--recycle-bin", "--hide-unreadable"}, 2, 2, kAddUsage);
+  const ParsedArgs parsed =
+      ParseArgs(args, {"--readonly", "--encryption", "--recycle-bin", "--hide-unreadable"},
+                {"NAME", "PATH"}, 2, kAddUsage);
   ShareRecord share;
   share.name = parsed.positional[0];
   share.path = AbsoluteSharePath(parsed.positional[1]);
@@ -69,8 +184,13 @@ int Add(const Args& args) {
   share.encryption = parsed.Has("--encryption");
   share.recycle_bin = parsed.Has("--recycle-bin");
   share.hide_unreadable = parsed.Has("--hide-unreadable");
-  orvex::portable::AddShare(share);
+  WithRegistry([&share] { orvex::portable::AddShare(share, CheckNewShare); });
+  while (share.path.size() > 1 && share.path.back() == '/') share.path.pop_back();  // as stored
   std::cout << "added share " << share.name << " at " << share.path << "\n";
+  if (share.readonly) {
+    std::cout << "note: " << share.name
+              << " is read-only, and read-only shares are never indexed\n";
+  }
   return kExitOk;
 }
 
@@ -89,27 +209,14 @@ std::string Settings(const ShareRecord& share) {
   return text.empty() ? "-" : text;
 }
 
-std::string Pad(std::string text, size_t width) {
-  if (text.size() < width) text.resize(width, ' ');
-  return text;
-}
-
 void PrintTable(const std::vector<ShareRecord>& shares) {
   if (shares.empty()) {
     std::cout << "no shares registered\n";
     return;
   }
-  size_t name_width = 4;
-  size_t path_width = 4;
-  for (const ShareRecord& share : shares) {
-    name_width = std::max(name_width, share.name.size());
-    path_width = std::max(path_width, share.path.size());
-  }
-  std::cout << Pad("NAME", name_width) << "  " << Pad("PATH", path_width) << "  SETTINGS\n";
-  for (const ShareRecord& share : shares) {
-    std::cout << Pad(share.name, name_width) << "  " << Pad(share.path, path_width) << "  "
-              << Settings(share) << "\n";
-  }
+  std::vector<std::vector<std::string>> rows{{"NAME", "PATH", "SETTINGS"}};
+  for (const ShareRecord& share : shares) rows.push_back({share.name, share.path, Settings(share)});
+  std::cout << FormatTable(rows);
 }
 
 int List(const Args& args) {
@@ -117,8 +224,8 @@ int List(const Args& args) {
     std::cout << kListUsage;
     return kExitOk;
   }
-  const ParsedArgs parsed = ParseArgs(args, {"--json"}, 0, 0, kListUsage);
-  const std::vector<ShareRecord> shares = orvex::portable::LoadShares();
+  const ParsedArgs parsed = ParseArgs(args, {"--json"}, {}, 0, kListUsage);
+  const std::vector<ShareRecord> shares = WithRegistry(orvex::portable::LoadShares);
   if (parsed.Has("--json")) {
     std::cout << orvex::portable::FormatShareRegistry(shares);
   } else {
@@ -132,9 +239,13 @@ int Remove(const Args& args) {
     std::cout << kRemoveUsage;
     return kExitOk;
   }
-  const ParsedArgs parsed = ParseArgs(args, {}, 1, 1, kRemoveUsage);
+  const ParsedArgs parsed = ParseArgs(args, {}, {"NAME"}, 1, kRemoveUsage);
   const std::string& name = parsed.positional[0];
-  if (!orvex::portable::RemoveShare(name)) throw orvex::Error(orvex::kErrorNoShare, name);
+  if (!WithRegistry([&name] { return orvex::portable::RemoveShare(name); })) {
+    throw orvex::Error(orvex::kErrorNoShare, "no share is called " + Quote(name) + " in " +
+                                                 RegistryPath() +
+                                                 "; see the registered shares: orvex share list");
+  }
   std::cout << "removed share " << name << "\n";
   return kExitOk;
 }

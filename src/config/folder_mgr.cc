@@ -8,11 +8,12 @@
 #include <cerrno>
 
 #include "foundation/check.h"
+#include "foundation/state_file.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/util.h"
 #include "orvex/platform/sdk_credentials.h"
-#include "orvex/portable/root.h"
+#include "platform/fixed_path.h"
 
 namespace orvex {
 namespace fileindex {
@@ -20,13 +21,14 @@ namespace {
 
 constexpr char kLogSource[] = "folder_mgr";
 
-std::string FoldersPath() { return portable::RootPath(kFileIndexFoldersCfgPath); }
-
+std::string FoldersPath() { return sdk::FixedPath(kFileIndexFoldersCfgPath); }
 
 }  // namespace
 
 FolderMgr::FolderMgr() {
   const std::string path = FoldersPath();
+  const std::string not_a_file = NotARegularFile(path);
+  ORVEX_CHECK(!not_a_file.empty(), kErrorLoadJson, "Cannot load json: " + path + not_a_file);
   Json::Value folders(Json::arrayValue);
   ORVEX_CHECK_AS(
       IsFileExist(path) && !fromFile(folders, path),

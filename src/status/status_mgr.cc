@@ -8,6 +8,7 @@
 #include <string>
 
 #include "foundation/check.h"
+#include "foundation/state_file.h"
 #include "orvex/communication.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
@@ -15,7 +16,7 @@
 #include "orvex/foundation/system_hooks.h"
 #include "orvex/foundation/util.h"
 #include "orvex/platform/sdk_credentials.h"
-#include "orvex/portable/root.h"
+#include "platform/fixed_path.h"
 
 namespace orvex {
 namespace fileindex {
@@ -27,18 +28,17 @@ constexpr char kResumeTimeKey[] = "resume_time";
 constexpr char kShareKey[] = "share";
 constexpr uint32_t kSecondsPerHour = 3600;
 
-std::string StatusPath() { return portable::RootPath(kFileIndexStatusCfgPath); }
+std::string StatusPath() { return sdk::FixedPath(kFileIndexStatusCfgPath); }
 
 const Json::Value* FindMember(const Json::Value& object, const char* key) {
   return object.find(key, key + std::strlen(key));
 }
 
-
 // Every change holds the status lock exclusively, as the folder
 // configuration's writers hold theirs. Under a fresh ORVEX_ROOT its "tmp"
 // directory may be missing too.
 LockFile TakeStatusLock() {
-  const std::string path = portable::RootPath(kFileIndexStatusLockPath);
+  const std::string path = sdk::FixedPath(kFileIndexStatusLockPath);
   MakeParentDirectories(path);
   return LockFile(path, /*exclusive=*/true);
 }
@@ -47,6 +47,8 @@ LockFile TakeStatusLock() {
 
 StatusMgr::StatusMgr() {
   const std::string path = StatusPath();
+  const std::string not_a_file = NotARegularFile(path);
+  ORVEX_CHECK(!not_a_file.empty(), kErrorLoadJson, "Cannot load json: " + path + not_a_file);
   ORVEX_CHECK_AS(IsFileExist(path) && !fromFile(data_, path),
                  "IsFileExist(kFileIndexStatusCfgPath) && !data_.fromFile(kFileIndexStatusCfgPath)",
                  kErrorLoadJson, "Cannot load json: " + path);

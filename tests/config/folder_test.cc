@@ -3,7 +3,6 @@
 // listing and a folder's status, against a real share registry, status file
 // and share queue.
 #include "orvex/config/folder.h"
-#include "orvex/config/folder_mgr.h"
 
 #include <gtest/gtest.h>
 #include <json/json.h>
@@ -18,6 +17,7 @@
 #include <functional>
 #include <memory>
 
+#include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"
@@ -274,7 +274,7 @@ TEST_F(FolderMgrTest, ListSortsFoldingCaseThenDropsOffsetAndCutsToLimit) {
   EXPECT_EQ((Paths{"/s/alpha", "/s/Zulu", "/s/éa", "/s/Éb"}), page(0, 10, "path", ""));
   EXPECT_EQ((Paths{"/s/Éb", "/s/Zulu", "/s/éa", "/s/alpha"}), page(0, 10, "size", "asc"));
   EXPECT_EQ((Paths{"/s/éa", "/s/Zulu"}), page(1, 2, "path", "desc"));
-  EXPECT_EQ((Paths{"/s/Zulu", "/s/éa"}), page(1, 2, "path", "DESC"));  // only "desc" reverses
+  EXPECT_EQ((Paths{"/s/Zulu", "/s/éa"}), page(1, 2, "path", "DESC"));     // only "desc" reverses
   EXPECT_EQ((Paths{"/s/Zulu", "/s/alpha"}), page(2, 2, "photo", "asc"));  // off sorts first
   EXPECT_TRUE(page(0xFFFFFFFFu, 10, "path", "").empty());
   EXPECT_TRUE(page(0, 0, "path", "").empty());

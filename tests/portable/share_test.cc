@@ -3,6 +3,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <filesystem>
+#include <functional>
 #include <stdexcept>
 #include <string>
 #include <tuple>
@@ -12,6 +15,7 @@
 #include "kalo/kalo_error.h"
 #include "kalo/kalo_share.h"
 #include "kalo_test_root.h"
+#include "orvex/portable/atomic_file.h"
 #include "orvex/portable/share_registry.h"
 
 namespace orvex {
@@ -94,6 +98,17 @@ TEST_F(ShareRegistryTest, AddRefusesBadRecordsAndWritesNothing) {
       {Share("", "/a"), "name is empty"},
       {Share("a", "srv/a"), "not absolute"},
       {Share("a", "/srv/../etc"), "component"},
+      // Bad bytes are shown escaped, never raw on a terminal.
+      {Share("a\x01"
+             "b",
+             "/a"),
+       "share \"a\\x01b\": the name contains the control character U+0001"},
+      {Share("a\xC2\x85", "/a"), "the name contains the control character U+0085"},
+      {Share("a\xFF"
+             "b",
+             "/a"),
+       "share \"a\\xFFb\": the name is not valid UTF-8 (byte 0xFF at offset 1)"},
+      {Share("\xE5\x86", "/a"), "not valid UTF-8 (byte 0xE5 at offset 0)"},  // cut short
   };
   for (const auto& [share, problem] : cases) {
     try {
@@ -103,7 +118,83 @@ TEST_F(ShareRegistryTest, AddRefusesBadRecordsAndWritesNothing) {
       EXPECT_NE(std::string(e.what()).find(problem), std::string::npos) << e.what();
     }
   }
-  EXPECT_FALSE(std::filesystem::exists(registry_));
+  AddShare(Share("写真 Ärger", "/srv/photo"));  // UTF-8 names are fine
+  EXPECT_EQ(Names(), std::vector<std::string>{"写真 Ärger"});
+}
+
+TEST_F(ShareRegistryTest, AddCheckSeesTheRegistryAndTheStoredRecordAndMayRefuse) {
+  AddShare(Share("a", "/srv/a"));
+  std::vector<std::string> seen;
+  auto refuse = [&seen](const std::vector<ShareRecord>& shares, const ShareRecord& share) {
+    for (const ShareRecord& other : shares) seen.push_back(other.name);
+    seen.push_back(share.path);
+    throw std::logic_error("refused");
+  };
+  EXPECT_THROW(AddShare(Share("b", "/srv/b//"), refuse), std::logic_error);
+  EXPECT_EQ(seen, (std::vector<std::string>{"a", "/srv/b"}));
+  EXPECT_EQ(Names(), std::vector<std::string>{"a"}) << "a refused share must not be written";
+  AddShare(Share("b", "/srv/b"), [](const std::vector<ShareRecord>&, const ShareRecord&) {});
+  EXPECT_EQ(Names(), (std::vector<std::string>{"a", "b"}));
+}
+
+// A link or a directory in the registry's place is reported as what it is:
+// never read as "no shares", never replaced by the next add.
+TEST_F(ShareRegistryTest, ALinkOrDirectoryInTheRegistrysPlaceIsReportedAndKept) {
+  WriteRegistry("[]");
+  const std::string real = root_ + "/etc/orvex/real.json";
+  std::filesystem::rename(registry_, real);
+  const struct {
+    const char* what;
+    std::function<void()> make;
+    int error_number;
+    std::string message;
+  } cases[] = {
+      {"link to a good registry", [&] { std::filesystem::create_symlink(real, registry_); }, ELOOP,
+       registry_ + " is a symbolic link"},
+      {"dangling link", [&] { std::filesystem::create_symlink(root_ + "/gone", registry_); }, ELOOP,
+       registry_ + " is a symbolic link"},
+      {"directory", [&] { std::filesystem::create_directory(registry_); }, EISDIR,
+       registry_ + " is a directory"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.what);
+    std::filesystem::remove(registry_);
+    c.make();
+    for (const auto& call : std::vector<std::function<void()>>{
+             [] { LoadShares(); }, [] { AddShare(Share("a", "/srv/a")); }}) {
+      try {
+        call();
+        ADD_FAILURE() << "no error";
+      } catch (const ShareRegistryError& e) {
+        EXPECT_EQ(e.kind(), ShareRegistryError::Kind::kLoad);
+        EXPECT_EQ(e.error_number(), c.error_number);
+        EXPECT_EQ(e.what(), c.message);
+      }
+    }
+    EXPECT_NE(std::filesystem::symlink_status(registry_).type(),
+              std::filesystem::file_type::regular);
+  }
+  EXPECT_EQ(testing::ReadFileText(real), "[]");
+}
+
+// Every state and registry file is saved this way: a link or a directory in
+// the target's place fails before anything is written.
+TEST_F(ShareRegistryTest, AtomicWriteRefusesALinkOrADirectoryAndLeavesNothingBehind) {
+  const std::string dir = root_ + "/state";
+  std::filesystem::create_directories(dir + "/sub");
+  testing::TempDir outside;
+  std::filesystem::create_symlink(outside.Join("target"), dir + "/link");
+  errno = 0;
+  EXPECT_FALSE(WriteFileAtomic(dir + "/link", "new"));
+  EXPECT_EQ(errno, ELOOP);
+  EXPECT_FALSE(WriteFileAtomic(dir + "/sub", "new"));
+  EXPECT_EQ(errno, EISDIR);
+  EXPECT_TRUE(std::filesystem::is_symlink(dir + "/link"));
+  EXPECT_FALSE(std::filesystem::exists(outside.Join("target")));
+  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir), {}), 2)
+      << "temporary file left";
+  ASSERT_TRUE(WriteFileAtomic(dir + "/file", "data"));
+  EXPECT_EQ(testing::ReadFileText(dir + "/file"), "data");
 }
 
 TEST_F(ShareRegistryTest, ConcurrentAddsFromProcessesAllLand) {

@@ -30,8 +30,11 @@ class ProgramTest : public ::testing::Test {
       : program_(std::string(ORVEX_BUILD_DIR) + "/" + name) {}
   void SetUp() override { ASSERT_EQ(0, ::access(program_.c_str(), X_OK)) << program_; }
 
-  ProgramOutcome Run(const std::vector<std::string>& args) {
-    return RunProgram(program_, args, {"ORVEX_ROOT=" + root_.path(), "TZ=UTC"}, io_.path());
+  // input_path, when given, is the program's standard input.
+  ProgramOutcome Run(const std::vector<std::string>& args,
+                     const std::string& input_path = std::string()) {
+    return RunProgram(program_, args, {"ORVEX_ROOT=" + root_.path(), "TZ=UTC"}, io_.path(),
+                      input_path);
   }
   // Runs args expecting exit status 0 and returns stdout as JSON.
   Json::Value RunJson(const std::vector<std::string>& args) {

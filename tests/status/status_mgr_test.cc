@@ -140,6 +140,44 @@ TEST_F(StatusMgrTest, BadFileThrows504AndFailedSaveThrows505LeavingTheFileWhole)
       << "no temporary file may be left behind";
 }
 
+// A link or a directory where the status file belongs is reported, never
+// read as "running, no flags" and never replaced by a save.
+TEST_F(StatusMgrTest, ALinkOrDirectoryInTheFilesPlaceIsReportedAndNeverReplaced) {
+  const std::filesystem::path etc = std::filesystem::path(status_path_).parent_path();
+  std::filesystem::create_directories(etc);
+  root_.Write("var/packages/Orvex/etc/real.status", "{\"resume_time\": 0}");
+  const struct {
+    const char* what;
+    bool directory;
+    const char* link_target;
+    const char* ends;
+  } cases[] = {
+      {"link to a good file", false, "real.status", " is a symbolic link"},
+      {"dangling link", false, "gone", " is a symbolic link"},
+      {"directory", true, nullptr, " is a directory"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.what);
+    std::filesystem::remove(status_path_);
+    StatusMgr loaded_before;  // no file yet: running, no flags
+    if (c.directory) {
+      std::filesystem::create_directory(status_path_);
+    } else {
+      std::filesystem::create_symlink(c.link_target, status_path_);
+    }
+    const Error load = ErrorOf([] { StatusMgr(); });
+    EXPECT_EQ(load.code(), kErrorLoadJson);
+    EXPECT_EQ(load.reason(), "Cannot load json: " + status_path_ + c.ends);
+    const Error save = ErrorOf([&] { loaded_before.SetShareStatus("photo", NeedReindex); });
+    EXPECT_EQ(save.code(), kErrorSaveJson);
+    EXPECT_EQ(save.reason(), "Failed to save json: " + status_path_);
+    EXPECT_NE(std::filesystem::symlink_status(status_path_).type(),
+              std::filesystem::file_type::regular)
+        << "replaced by the save";
+  }
+  EXPECT_EQ(testing::ReadFileText((etc / "real.status").string()), "{\"resume_time\": 0}");
+}
+
 }  // namespace
 }  // namespace fileindex
 }  // namespace orvex

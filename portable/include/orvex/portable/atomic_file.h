@@ -2,6 +2,9 @@
 // to a temporary file in the same directory, is flushed to disk and renamed
 // over the target. Readers need no lock: they see the old or the new file.
 // Safe for concurrent use (each call uses its own temporary name).
+// Who may include it: in the library, only the platform layer (src/platform/),
+// the one door through which every subsystem reaches the platform, and the
+// foundation beneath it; the programs and the tests may include it freely.
 #ifndef ORVEX_PORTABLE_ATOMIC_FILE_H_
 #define ORVEX_PORTABLE_ATOMIC_FILE_H_
 
@@ -12,9 +15,11 @@
 namespace orvex {
 namespace portable {
 
-// Replaces path with data, mode `mode` (before the umask is not applied: the
-// mode is set explicitly). Returns false with errno set on any failure; the
-// old file is then left as it was and no temporary file remains.
+// Replaces path with data, mode `mode` (the umask does not apply: the mode is
+// set explicitly). Returns false with errno set on any failure; the old file
+// is then left as it was and no temporary file remains. A path that is a
+// symbolic link fails with ELOOP and a directory with EISDIR, before anything
+// is written: a save never replaces a link with a plain file.
 bool WriteFileAtomic(const std::string& path, const std::string& data, mode_t mode = 0644);
 
 // Reads the whole file into data. Returns false with errno set on failure;
