@@ -6,8 +6,8 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cstdio>
 #include <cstddef>
+#include <cstdio>
 #include <functional>
 #include <vector>
 

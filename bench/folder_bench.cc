@@ -25,24 +25,24 @@
 #include <string>
 #include <vector>
 
+#include "bench_timing.h"
 #include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/log.h"
 #include "orvex/queue/queue_mgr.h"
-#include "bench_timing.h"
 
 namespace {
 
+using orvex::bench::SecondsOf;
 using orvex::fileindex::Folder;
 using orvex::fileindex::FolderMgr;
 using orvex::fileindex::QueueMgr;
-using orvex::bench::SecondsOf;
 
-constexpr int kGroups = 10;             // top-level folders
-constexpr int kPerGroup = 99;           // subfolders of each
-constexpr int kBusyFolders = 10;        // subfolders the queue's events lie below
-constexpr int kLookups = 200000;        // GetMostSuitableCfg calls timed
-constexpr int kPlainListRepeats = 20;   // lists without status timed
+constexpr int kGroups = 10;            // top-level folders
+constexpr int kPerGroup = 99;          // subfolders of each
+constexpr int kBusyFolders = 10;       // subfolders the queue's events lie below
+constexpr int kLookups = 200000;       // GetMostSuitableCfg calls timed
+constexpr int kPlainListRepeats = 20;  // lists without status timed
 constexpr char kShare[] = "bench";
 
 // A temporary ORVEX_ROOT holding the share, its folders, the folder file, a
@@ -135,9 +135,10 @@ void BenchGoverningFolder(const BenchRoot& root) {
       found += mgr.GetMostSuitableCfg(probes[i % probes.size()]) ? 1 : 0;
     }
   });
-  std::printf("GetMostSuitableCfg, %zu folders: first call %.1f ms (fills the full-path caches), "
-              "then %.0f ns per call (%d calls, %zu governed)\n",
-              mgr.GetFolders().size(), first * 1e3, loop / kLookups * 1e9, kLookups, found);
+  std::printf(
+      "GetMostSuitableCfg, %zu folders: first call %.1f ms (fills the full-path caches), "
+      "then %.0f ns per call (%d calls, %zu governed)\n",
+      mgr.GetFolders().size(), first * 1e3, loop / kLookups * 1e9, kLookups, found);
 }
 
 // FolderList as the web API builds it: load, List, one record per folder.
@@ -159,9 +160,10 @@ void BenchList(const BenchRoot& root, int queue_lines) {
   const double plain = SecondsOf([&] {
     for (int i = 0; i < kPlainListRepeats; ++i) listed = ListAll(Json::Value(Json::arrayValue));
   });
-  std::printf("FolderList, %zu folders sorted by path, no status: %.1f ms per list "
-              "(load, sort, records)\n",
-              listed, plain / kPlainListRepeats * 1e3);
+  std::printf(
+      "FolderList, %zu folders sorted by path, no status: %.1f ms per list "
+      "(load, sort, records)\n",
+      listed, plain / kPlainListRepeats * 1e3);
 
   std::vector<std::string> texts;
   Json::Value status(Json::arrayValue);
@@ -169,10 +171,11 @@ void BenchList(const BenchRoot& root, int queue_lines) {
   const double with_status = SecondsOf([&] { ListAll(status, &texts); });
   const long processing = std::count(texts.begin(), texts.end(), "processing");
   const long finished = std::count(texts.begin(), texts.end(), "finished");
-  std::printf("FolderList, %zu folders sorted by path, with status, %d-line queue: %.2f s "
-              "(%.1f ms per folder; %ld processing, %ld finished)\n",
-              texts.size(), queue_lines, with_status, with_status / texts.size() * 1e3, processing,
-              finished);
+  std::printf(
+      "FolderList, %zu folders sorted by path, with status, %d-line queue: %.2f s "
+      "(%.1f ms per folder; %ld processing, %ld finished)\n",
+      texts.size(), queue_lines, with_status, with_status / texts.size() * 1e3, processing,
+      finished);
 
   // Best of three: single runs of these are at the mercy of other processes.
   double load = 1e9;
@@ -183,9 +186,10 @@ void BenchList(const BenchRoot& root, int queue_lines) {
     const std::string asked = root.share_root() + "/Group9";
     scan = std::min(scan, SecondsOf([&] { queue.IsFullPathProcessing(asked); }));
   }
-  std::printf("  where a finished folder's status goes: folder file load %.2f ms (once per "
-              "queue question), full scan of the queue %.1f ms (%.2f us per line)\n",
-              load * 1e3, (scan - load) * 1e3, (scan - load) / queue_lines * 1e6);
+  std::printf(
+      "  where a finished folder's status goes: folder file load %.2f ms (once per "
+      "queue question), full scan of the queue %.1f ms (%.2f us per line)\n",
+      load * 1e3, (scan - load) * 1e3, (scan - load) / queue_lines * 1e6);
 }
 
 }  // namespace

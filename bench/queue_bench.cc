@@ -27,22 +27,22 @@
 #include <string>
 #include <vector>
 
+#include "bench_timing.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/log.h"
 #include "orvex/queue/op_tree.h"
 #include "queue/line_reader.h"
-#include "bench_timing.h"
 #include "queue_generator.h"
 
 namespace {
 
-using orvex::fileindex::Event;
-using orvex::fileindex::LineReader;
-using orvex::fileindex::OPTree;
 using orvex::bench::Clock;
 using orvex::bench::Fastest;
 using orvex::bench::Report;
 using orvex::bench::Seconds;
+using orvex::fileindex::Event;
+using orvex::fileindex::LineReader;
+using orvex::fileindex::OPTree;
 
 constexpr size_t kDefaultLines = 1000000;
 constexpr size_t kFiles = 100000;

@@ -19,22 +19,22 @@
 #include <functional>
 #include <string>
 
+#include "bench_timing.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/log.h"
 #include "orvex/queue/queue_mgr.h"
 #include "queue/line_reader.h"
-#include "bench_timing.h"
 #include "queue_generator.h"
 
 namespace {
 
-using orvex::fileindex::LineReader;
-using orvex::fileindex::QueueMgr;
 using orvex::bench::Clock;
 using orvex::bench::Fastest;
 using orvex::bench::Report;
 using orvex::bench::Seconds;
+using orvex::fileindex::LineReader;
+using orvex::fileindex::QueueMgr;
 
 constexpr size_t kDefaultLines = 1000000;
 constexpr double kScanParseTarget = 1.2;

@@ -22,8 +22,8 @@ using orvex::fileindex::Event;
 using orvex::fileindex::EventFields;
 using orvex::fileindex::OPTree;
 
-const std::string kLine = orvex::bench::DaemonLine(
-    orvex::bench::kMaskModify, false, "/volume1/photo/album 0042/IMG_0001234.JPG");
+const std::string kLine = orvex::bench::DaemonLine(orvex::bench::kMaskModify, false,
+                                                   "/volume1/photo/album 0042/IMG_0001234.JPG");
 
 // A tree with `paths` files pending, 1000 to a directory.
 std::unique_ptr<OPTree> TreeWith(size_t paths, std::vector<std::string>& names) {
@@ -72,8 +72,8 @@ void BM_FoldModifyIntoPendingUpsert(benchmark::State& state) {
   auto tree = TreeWith(static_cast<size_t>(state.range(0)), names);
   std::vector<std::shared_ptr<Event>> modifies;
   for (const auto& name : names) {
-    modifies.push_back(std::make_shared<Event>(
-        orvex::bench::DaemonLine(orvex::bench::kMaskModify, false, name)));
+    modifies.push_back(
+        std::make_shared<Event>(orvex::bench::DaemonLine(orvex::bench::kMaskModify, false, name)));
   }
   size_t i = 0;
   for (auto _ : state) {

@@ -1,8 +1,7 @@
 #include "orvex/config/folder.h"
 
-#include "orvex/config/folder_mgr.h"
-
 #include "foundation/check.h"
+#include "orvex/config/folder_mgr.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"

@@ -21,12 +21,11 @@ namespace internal {
 
 // Logs the failed check and throws Error(code, reason). errno is 0 when the
 // exception reaches the caller.
-[[noreturn]] void FailCheck(const char* source, int line, const char* condition,
-                            ErrorCode code, const std::string& reason);
+[[noreturn]] void FailCheck(const char* source, int line, const char* condition, ErrorCode code,
+                            const std::string& reason);
 
 // Logs a failed check without throwing (for optional steps that only log).
-void LogFailedCheck(const char* source, int line, const char* condition,
-                    const std::string& reason);
+void LogFailedCheck(const char* source, int line, const char* condition, const std::string& reason);
 
 }  // namespace internal
 }  // namespace orvex

@@ -134,8 +134,8 @@ class Scanner {
       ++at_;
     }
     if (value > kMaxUInt || (*start == '0' && at_ - start > 1)) return false;
-    if (at_ < end_ && *at_ != ',' && *at_ != '}' && *at_ != ' ' && *at_ != '\t' &&
-        *at_ != '\r' && *at_ != '\n') {
+    if (at_ < end_ && *at_ != ',' && *at_ != '}' && *at_ != ' ' && *at_ != '\t' && *at_ != '\r' &&
+        *at_ != '\n') {
       return false;
     }
     out = static_cast<uint32_t>(value);

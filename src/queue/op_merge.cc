@@ -38,16 +38,13 @@ constexpr Rule Merge() { return {Action::kMerge, OP_UPDATE_CFG}; }
 //                        DELETE               UPSERT             ATTR
 //                        UPDATE_CFG           RENAME             REINDEX
 using RuleRow = Rule[6];
-constexpr RuleRow kCreateRules = {Upgrade(OP_UPSERT), Drop(), Upgrade(OP_UPSERT),
-                                  Drop(), Nothing(), Drop()};
-constexpr RuleRow kModifyRules = {Drop(), Drop(), Upgrade(OP_UPSERT),
-                                  Drop(), Nothing(), Drop()};
-constexpr RuleRow kAttrRules = {Drop(), Drop(), Drop(),
-                                Drop(), Nothing(), Drop()};
-constexpr RuleRow kDeleteRules = {Drop(), Upgrade(OP_DELETE), Upgrade(OP_DELETE),
-                                  Nothing(), Nothing(), Nothing()};
-constexpr RuleRow kUpdateCfgRules = {Drop(), Replace(), Replace(),
-                                     Merge(), Nothing(), Drop()};
+constexpr RuleRow kCreateRules = {Upgrade(OP_UPSERT), Drop(), Upgrade(OP_UPSERT), Drop(),
+                                  Nothing(),          Drop()};
+constexpr RuleRow kModifyRules = {Drop(), Drop(), Upgrade(OP_UPSERT), Drop(), Nothing(), Drop()};
+constexpr RuleRow kAttrRules = {Drop(), Drop(), Drop(), Drop(), Nothing(), Drop()};
+constexpr RuleRow kDeleteRules = {Drop(),    Upgrade(OP_DELETE), Upgrade(OP_DELETE),
+                                  Nothing(), Nothing(),          Nothing()};
+constexpr RuleRow kUpdateCfgRules = {Drop(), Replace(), Replace(), Merge(), Nothing(), Drop()};
 
 void ApplyRule(const Rule& rule, OP& incoming, OP& pending) {
   switch (rule.action) {

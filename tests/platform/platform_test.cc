@@ -137,7 +137,7 @@ TEST_F(SDKShareTest, ListShareLocationsKeepsRegistryOrderAndNamesTheCauseOfAFail
 TEST(RunProgramTest, PassesEveryArgumentAndReportsTheExitStatus) {
   // sh -c SCRIPT NAME ARGS...: the script sees ARGS as $1..., and exits with
   // their count, so a lost or extra argument changes the status.
-  const std::vector<std::string> fourteen = {"-c", "exit $#", "sh", "1", "2", "3", "4",
+  const std::vector<std::string> fourteen = {"-c", "exit $#", "sh", "1", "2", "3",  "4",
                                              "5",  "6",       "7",  "8", "9", "10", ""};
   EXPECT_EQ(RunProgram("/bin/sh", fourteen), 11);
   EXPECT_EQ(RunProgram("/bin/sh", {"-c", "exit 7"}), 7);

@@ -121,10 +121,10 @@ TEST_F(SharePathTest, CanPathBeIndexed) {
   for (const char* path : {"/photo", "/photo/2024/@tmp", "/photo/linkdir"}) {
     EXPECT_TRUE(CanPathBeIndexed(path)) << path;
   }
-  for (const char* path : {"/photo/@tmp", "/photo/2024/@eaDir", "/photo/#snapshot",
-                           "/photo/#recycle", "/photo/2024/..", "/photo//2024", "/photo/2024/",
-                           "/photo/missing", "/photo/file.txt", "photo/2024", "/Photo", "/gone",
-                           "/ro"}) {
+  for (const char* path :
+       {"/photo/@tmp", "/photo/2024/@eaDir", "/photo/#snapshot", "/photo/#recycle",
+        "/photo/2024/..", "/photo//2024", "/photo/2024/", "/photo/missing", "/photo/file.txt",
+        "photo/2024", "/Photo", "/gone", "/ro"}) {
     EXPECT_FALSE(CanPathBeIndexed(path)) << "[" << path << "]";
   }
 }

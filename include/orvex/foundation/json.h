@@ -64,10 +64,10 @@ ORVEX_EXPORT bool toFile(const Json::Value& value, const std::string& path);
 // a queue line or a log field. Strings keep their bytes (UTF-8 unescaped).
 ORVEX_EXPORT std::string toString(const Json::Value& value);
 
-#define ORVEX_DECLARE_JSON_TYPE(T)                              \
-  template <>                                                   \
-  ORVEX_EXPORT bool isJsonType<T>(const Json::Value& v);        \
-  template <>                                                   \
+#define ORVEX_DECLARE_JSON_TYPE(T)                       \
+  template <>                                            \
+  ORVEX_EXPORT bool isJsonType<T>(const Json::Value& v); \
+  template <>                                            \
   ORVEX_EXPORT T asJsonType<T>(const Json::Value& v);
 ORVEX_DECLARE_JSON_TYPE(std::string)
 ORVEX_DECLARE_JSON_TYPE(bool)

@@ -16,14 +16,14 @@ namespace fileindex {
 
 // Bits of an event's mask, with their wire values. Other bits are ignored.
 enum EventMask : uint32_t {
-  EVENT_MODIFY = 0x2,             // content changed
-  EVENT_ATTR = 0x4,               // attributes changed
-  EVENT_CREATE = 0x40,            // created or moved in
-  EVENT_DELETE = 0x80,            // deleted or moved out
-  EVENT_RENAME = 0x100,           // renamed from path_old to path
-  EVENT_QUEUE_CRASHED = 0x200,    // the producer lost events
-  EVENT_REINDEX = 0x10000,        // custom: reindex this path
-  EVENT_UPDATE_CFG = 0x20000,     // custom: folder configuration changed, data holds it
+  EVENT_MODIFY = 0x2,           // content changed
+  EVENT_ATTR = 0x4,             // attributes changed
+  EVENT_CREATE = 0x40,          // created or moved in
+  EVENT_DELETE = 0x80,          // deleted or moved out
+  EVENT_RENAME = 0x100,         // renamed from path_old to path
+  EVENT_QUEUE_CRASHED = 0x200,  // the producer lost events
+  EVENT_REINDEX = 0x10000,      // custom: reindex this path
+  EVENT_UPDATE_CFG = 0x20000,   // custom: folder configuration changed, data holds it
 };
 
 class ORVEX_EXPORT Event {

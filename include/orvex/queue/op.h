@@ -49,8 +49,8 @@ struct ORVEX_EXPORT OP {
 
   std::shared_ptr<OPNode> node;  // the node whose path the op concerns
   FileIndexOP kind;
-  std::string path;              // for OP_RENAME the old path, else empty
-  Json::Value data;              // for OP_UPDATE_CFG the change, else null
+  std::string path;  // for OP_RENAME the old path, else empty
+  Json::Value data;  // for OP_UPDATE_CFG the change, else null
 };
 
 class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
@@ -122,8 +122,8 @@ class ORVEX_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   std::vector<std::shared_ptr<OPNode>> children_;
   std::vector<std::shared_ptr<OP>> ops_;
   size_t live_after_prune_ = 0;
-  uint64_t key_;      // this node's key in index_
-  NodeIndex* index_;  // shared with the tree this node heads or belongs to
+  uint64_t key_;                            // this node's key in index_
+  NodeIndex* index_;                        // shared with the tree this node heads or belongs to
   std::unique_ptr<NodeIndex> owned_index_;  // set when this node heads a tree
 };
 
