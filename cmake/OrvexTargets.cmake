@@ -100,7 +100,11 @@ function(orvex_programs)
         target_include_directories(${prog} PRIVATE ${PROJECT_SOURCE_DIR}/src)
         if(prog STREQUAL "kalocontentextractd")
           # The one program that runs the parsers, in its worker processes.
-          target_link_libraries(${prog} PRIVATE orvex_extract)
+          target_link_libraries(${prog} PRIVATE orvex_extractd orvex_extract)
+        endif()
+        if(prog STREQUAL "kalonotifyd")
+          # The watcher's loop lives in its own library, which its tests share.
+          target_link_libraries(${prog} PRIVATE orvex_watch)
         endif()
         if(prog STREQUAL "kalopmxnotify" OR prog STREQUAL "kalocontentextractd")
           # The library runs these tools from the platform's own fixed place

@@ -14,7 +14,7 @@
 #include "extract_client.h"
 #include "kalo/kalo_error.h"
 #include "kalo_log.h"
-#include "orvex/portable/extract_service.h"
+#include "orvex/portable/extract_protocol.h"
 #include "orvex/portable/root.h"
 
 namespace KALO {
@@ -88,8 +88,7 @@ void MergeMetadata(const Json::Value& meta, Json::Value& doc) {
 
 ExtractOutcome Extract(const std::string& path, const Json::Value& cfg) {
   using orvex::portable::RootPath;
-  const int deadline_ms =
-      Setting(cfg, "deadline_ms", orvex::portable::kDefaultExtractDeadlineMs);
+  const int deadline_ms = Setting(cfg, "deadline_ms", orvex::portable::kDefaultExtractDeadlineMs);
   const int memory_mb = Setting(cfg, "memory_mb", orvex::portable::kDefaultExtractMemoryMb);
   ExtractOutcome outcome;
   if (orvex::portable::AskExtractDaemon(RootPath(orvex::portable::kExtractSocketPath), path,

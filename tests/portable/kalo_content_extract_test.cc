@@ -8,23 +8,23 @@
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <signal.h>
-#include <sys/syscall.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <ctime>
 #include <filesystem>
-#include <chrono>
 #include <fstream>
 #include <functional>
-#include <sstream>
 #include <set>
+#include <sstream>
 #include <string>
 #include <vector>
 
 #include "kalo/kalo_error.h"
-#include "orvex/portable/extract_service.h"
+#include "orvex/portable/extract_protocol.h"
 #include "support/run_program.h"
 #include "support/temp_dir.h"
 
@@ -161,7 +161,6 @@ TEST_F(ContentExtractTest, ItemThatCannotBeExaminedFailsAndLeavesTheOutputAlone)
   }
 }
 
-
 // ---- Metadata through the extraction program ----------------------------
 
 const char kProgramBuilt[] = ORVEX_BUILD_DIR "/kalocontentextractd";
@@ -204,9 +203,10 @@ class IsolatedExtractTest : public ::testing::TestWithParam<bool> {
   void StartDaemon() {
     const orvex::testing::ProgramOutcome started = orvex::testing::RunProgram(
         kProgramBuilt, {"--workers", "1", "--deadline-ms", "300", "--memory-mb", "64"},
-        {"ORVEX_ROOT=" + root_.path(), "ORVEX_EXTRACT_FAULTS=1"}, io_.path());
+        {"ORVEX_ROOT=" + root_.path()}, io_.path());  // and the faults, while set here
     ASSERT_EQ(0, started.status) << started.err;
-    daemon_pid_ = std::stoi(orvex::testing::ReadFileText(root_.Join("var/run/kalocontentextractd.pid")));
+    daemon_pid_ =
+        std::stoi(orvex::testing::ReadFileText(root_.Join("var/run/kalocontentextractd.pid")));
   }
 
   // SIGTERM, then wait for the daemon (not our child) to be gone.
@@ -273,8 +273,8 @@ TEST_P(IsolatedExtractTest, EachFaultGivesAttributesIsRecordedAndIsNotRetried) {
     EXPECT_EQ(recorded, RecordInode()) << name << ": tried again";
     EXPECT_EQ(Runs(runs), Calls().size()) << name << ": tried again";
   }
-  EXPECT_NE(std::string::npos, Record()[files_.Join("movie.hang")]["reason"].asString().find(
-                                   "deadline of 300 ms"));
+  EXPECT_NE(std::string::npos,
+            Record()[files_.Join("movie.hang")]["reason"].asString().find("deadline of 300 ms"));
 }
 
 TEST_P(IsolatedExtractTest, ChangedFileIsTriedAgainAndForgottenOnceItExtracts) {
@@ -329,9 +329,9 @@ TEST_F(ContentExtractTest, MetadataIsMergedUnderTheAttributes) {
   orvex::testing::TempDir root;
   orvex::testing::ScopedOrvexRoot scoped(root.path());
   std::filesystem::create_directories(root.Join("usr/kalo/bin"));
-  const std::string program = root.Write(
-      "usr/kalo/bin/kalocontentextractd",
-      "#!/bin/sh\necho '{\"KALOMDTitle\": \"Title\", \"KALOMDFSName\": \"forged\"}'\n");
+  const std::string program =
+      root.Write("usr/kalo/bin/kalocontentextractd",
+                 "#!/bin/sh\necho '{\"KALOMDTitle\": \"Title\", \"KALOMDFSName\": \"forged\"}'\n");
   ASSERT_EQ(0, ::chmod(program.c_str(), 0755));
   const std::string path = dir_.Write("doc.pdf", "%PDF");
   Json::Value cfg;

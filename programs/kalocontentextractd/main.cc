@@ -1,0 +1,232 @@
+// kalocontentextractd: the content-extraction service. The parsers of
+// untrusted files run only in its worker processes, each with a deadline per
+// file and a memory cap, so that a file that crashes, hangs or eats memory
+// costs one worker (replaced at once) and never the caller.
+//
+//   kalocontentextractd [--foreground] [--workers N] [--deadline-ms MS] [--memory-mb MB]
+//   kalocontentextractd --extract PATH [--deadline-ms MS] [--memory-mb MB]
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/signalfd.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <iostream>
+#include <stdexcept>
+#include <string>
+
+#include "faults.h"
+#include "orvex/portable/atomic_file.h"
+#include "extract_service.h"
+#include "orvex/portable/file_descriptor.h"
+#include "orvex/portable/root.h"
+#include "orvex/version.h"
+
+namespace {
+
+using orvex::portable::ExtractService;
+using orvex::portable::ExtractServiceOptions;
+using orvex::portable::RootPath;
+
+constexpr char kIdent[] = "kalocontentextractd";
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = orvex::portable::kExtractExitUsage;
+constexpr int kRoundMs = 60000;  // any wait ends sooner at a deadline or a signal
+
+constexpr char kUsage[] =
+    "usage: kalocontentextractd [--foreground] [--workers N] [--deadline-ms MS] [--memory-mb MB]\n"
+    "       kalocontentextractd --extract PATH [--deadline-ms MS] [--memory-mb MB]\n"
+    "The content-extraction service: reads the metadata and text of files in\n"
+    "isolated worker processes and answers on /var/run/kalocontentextractd.sock\n"
+    "(under ORVEX_ROOT when set; mode 0660). A worker that crashes, passes the\n"
+    "deadline or the memory cap is replaced and the caller told why.\n"
+    "  --foreground     stay in the foreground (otherwise it detaches once its\n"
+    "                   socket is ready, and writes its pid to\n"
+    "                   /var/run/kalocontentextractd.pid)\n"
+    "  --workers N      worker processes, 1 to 16 (default 2)\n"
+    "  --deadline-ms MS time allowed per file (default 10000)\n"
+    "  --memory-mb MB   memory a worker may take beyond its start (default 512)\n"
+    "  --extract PATH   extract one file in this process and print its properties\n"
+    "                   as one JSON object: the one-shot mode used when no daemon runs\n"
+    "  --help, --version\n"
+    "Exit status of --extract: 0 done, 10 the file is corrupt (what was read is\n"
+    "printed, the reason goes to standard error), 11 the memory cap was reached,\n"
+    "12 not a regular file, 2 bad usage. The daemon exits 0 on SIGTERM, 1 when it\n"
+    "cannot start. Test facility: ORVEX_EXTRACT_FAULTS=1 makes files named *.crash,\n"
+    "*.hang and *.hog crash, hang and exhaust memory in the worker.\n";
+
+class UsageError : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+struct Options {
+  bool help = false;
+  bool version = false;
+  bool foreground = false;
+  std::string extract;  // one-shot mode when not empty
+  int workers = 2;
+  int deadline_ms = orvex::portable::kDefaultExtractDeadlineMs;
+  int memory_mb = orvex::portable::kDefaultExtractMemoryMb;
+};
+
+int Number(const std::string& option, const std::string& text, int low, int high) {
+  char* end = nullptr;
+  errno = 0;
+  const long value = std::strtol(text.c_str(), &end, 10);
+  if (text.empty() || *end != '\0' || errno != 0 || value < low || value > high) {
+    throw UsageError(option + " takes a number from " + std::to_string(low) + " to " +
+                     std::to_string(high) + ", not \"" + text + "\"");
+  }
+  return static_cast<int>(value);
+}
+
+Options ParseArgs(int argc, char** argv) {
+  Options opt;
+  for (int i = 1; i < argc; ++i) {
+    const std::string arg = argv[i];
+    const bool has_value = i + 1 < argc;
+    auto value = [&]() -> std::string {
+      if (!has_value) throw UsageError(arg + " needs a value");
+      return argv[++i];
+    };
+    if (arg == "--help") {
+      opt.help = true;
+    } else if (arg == "--version") {
+      opt.version = true;
+    } else if (arg == "--foreground") {
+      opt.foreground = true;
+    } else if (arg == "--extract") {
+      opt.extract = value();
+      if (opt.extract.empty()) throw UsageError("--extract needs a path");
+    } else if (arg == "--workers") {
+      opt.workers = Number(arg, value(), 1, 16);
+    } else if (arg == "--deadline-ms") {
+      opt.deadline_ms = Number(arg, value(), 1, 24 * 3600 * 1000);
+    } else if (arg == "--memory-mb") {
+      opt.memory_mb = Number(arg, value(), 1, 1 << 20);
+    } else {
+      throw UsageError("unknown argument " + arg);
+    }
+  }
+  return opt;
+}
+
+bool WriteAll(int fd, const std::string& text) {
+  for (size_t done = 0; done < text.size();) {
+    const ssize_t n = ::write(fd, text.data() + done, text.size() - done);
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return false;
+    done += static_cast<size_t>(n);
+  }
+  return true;
+}
+
+int ExtractOne(const Options& opt) {
+  std::string out;
+  std::string err;
+  const int status = orvex::portable::RunOneShot(opt.extract, opt.deadline_ms, opt.memory_mb,
+                                                 kalocontentextractd::MakeExtractor(), out, err);
+  if (!err.empty()) WriteAll(STDERR_FILENO, std::string(kIdent) + ": " + err + "\n");
+  if (!WriteAll(STDOUT_FILENO, out)) return kExitFailure;
+  return status;
+}
+
+// SIGTERM and SIGINT arrive through a descriptor the loop waits on, so a
+// stop is seen at once and never between a check and a wait.
+orvex::FileDescriptor StopSignals() {
+  sigset_t stop;
+  sigemptyset(&stop);
+  sigaddset(&stop, SIGTERM);
+  sigaddset(&stop, SIGINT);
+  ::sigprocmask(SIG_BLOCK, &stop, nullptr);
+  ::signal(SIGPIPE, SIG_IGN);
+  return orvex::FileDescriptor(::signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+// Detaches: the parent returns once the child says its socket is ready (one
+// byte on the pipe) or has failed (the pipe closes empty), so that whoever
+// started the daemon can use it as soon as the command returns.
+int Detach(orvex::FileDescriptor& ready) {
+  int fds[2];
+  if (::pipe2(fds, O_CLOEXEC) != 0) return kExitFailure;
+  orvex::FileDescriptor read_end(fds[0]);
+  ready.reset(fds[1]);
+  const pid_t pid = ::fork();
+  if (pid < 0) return kExitFailure;
+  if (pid > 0) {
+    ready.reset();
+    char byte = 0;
+    ssize_t n;
+    while ((n = ::read(read_end.get(), &byte, 1)) < 0 && errno == EINTR) {
+    }
+    return n == 1 ? 0 : kExitFailure;
+  }
+  ::setsid();
+  if (::chdir("/") != 0) return kExitFailure;
+  const orvex::FileDescriptor null(::open("/dev/null", O_RDWR | O_CLOEXEC));
+  for (int fd = 0; fd <= 2; ++fd) ::dup2(null.get(), fd);
+  return -1;  // in the daemon: go on
+}
+
+int Serve(const Options& opt) {
+  orvex::FileDescriptor ready;
+  if (!opt.foreground) {
+    const int status = Detach(ready);
+    if (status >= 0) return status;
+  }
+  ::openlog(kIdent, LOG_PID, LOG_DAEMON);
+  orvex::FileDescriptor stop = StopSignals();
+  ExtractServiceOptions options;
+  options.socket_path = RootPath(orvex::portable::kExtractSocketPath);
+  options.workers = opt.workers;
+  options.deadline_ms = opt.deadline_ms;
+  options.memory_mb = opt.memory_mb;
+  ExtractService service(options, kalocontentextractd::MakeExtractor());
+  if (!stop || !service.Start()) {
+    const std::string why = "cannot listen on " + options.socket_path + ": " + std::strerror(errno);
+    syslog(LOG_ERR, "%s", why.c_str());
+    std::cerr << kIdent << ": " << why << "\n";
+    return kExitFailure;
+  }
+  service.set_wake_fd(stop.get());
+  const std::string pid_path = RootPath(orvex::portable::kExtractPidPath);
+  if (!opt.foreground) {
+    orvex::portable::WriteFileAtomic(pid_path, std::to_string(::getpid()) + "\n");
+    WriteAll(ready.get(), "r");
+    ready.reset();
+  }
+  syslog(LOG_INFO, "listening on %s with %d workers", options.socket_path.c_str(), opt.workers);
+  while (!service.RunOnce(kRoundMs)) {
+  }
+  service.Stop();
+  if (!opt.foreground) ::unlink(pid_path.c_str());
+  syslog(LOG_INFO, "stopped");
+  return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options opt;
+  try {
+    opt = ParseArgs(argc, argv);
+  } catch (const UsageError& e) {
+    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
+    return kExitUsage;
+  }
+  if (opt.help) {
+    std::cout << kUsage;
+    return 0;
+  }
+  if (opt.version) {
+    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
+    return 0;
+  }
+  if (!opt.extract.empty()) return ExtractOne(opt);
+  return Serve(opt);
+}

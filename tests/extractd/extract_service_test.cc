@@ -1,0 +1,284 @@
+// The extraction daemon's loop driven step by step: real worker processes
+// forked from this test, real faults in them (a crash, an endless loop, an
+// endless allocation), and clients that misbehave on the real socket.
+#include "extract_service.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "orvex/portable/file_descriptor.h"
+#include "support/temp_dir.h"
+
+namespace orvex {
+namespace portable {
+namespace {
+
+#if defined(__SANITIZE_ADDRESS__)
+constexpr bool kSanitized = true;  // its allocator dies on its own when capped
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer)
+constexpr bool kSanitized = true;
+#else
+constexpr bool kSanitized = false;
+#endif
+#else
+constexpr bool kSanitized = false;
+#endif
+
+constexpr int kDeadlineMs = 300;
+constexpr int kMemoryMb = 64;
+
+bool EndsWith(const std::string& text, const std::string& suffix) {
+  return text.size() >= suffix.size() &&
+         text.compare(text.size() - suffix.size(), suffix.size(), suffix) == 0;
+}
+
+// Runs in the workers. A parser's faults, chosen by name; otherwise it
+// reports the file's first line as a title.
+bool TestExtractor(const std::string& path, Json::Value& out, std::string* problem) {
+  if (EndsWith(path, ".crash")) ::raise(SIGSEGV);
+  if (EndsWith(path, ".hang")) {
+    for (volatile int spin = 0;; spin = spin + 1) {
+    }
+  }
+  if (EndsWith(path, ".hog")) {
+    std::vector<char*> kept;
+    for (size_t i = 0; i < 4096; ++i) {  // 4 GiB: far past the cap
+      kept.push_back(new char[1 << 20]);
+      std::memset(kept.back(), 1, 1 << 20);
+    }
+    ::_exit(99);  // the cap did not stop it
+  }
+  if (EndsWith(path, ".bad")) {
+    out["KALOMDTitle"] = "partial";
+    *problem = "test parser: corrupt";
+    return false;
+  }
+  out["KALOMDTitle"] = path.substr(path.rfind('/') + 1);
+  return true;
+}
+
+class ExtractServiceTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    ExtractServiceOptions options;
+    options.socket_path = dir_.Join("run/extract.sock");
+    options.workers = 1;
+    options.deadline_ms = kDeadlineMs;
+    options.memory_mb = kMemoryMb;
+    options.max_request_bytes = 4096;
+    options.idle_ms = 200;
+    service_ = std::make_unique<ExtractService>(options, TestExtractor);
+    ASSERT_TRUE(service_->Start()) << std::strerror(errno);
+  }
+
+  FileDescriptor Connect() {
+    FileDescriptor fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    struct sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    const std::string path = dir_.Join("run/extract.sock");
+    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
+    EXPECT_EQ(0,
+              ::connect(fd.get(), reinterpret_cast<struct sockaddr*>(&address), sizeof(address)));
+    return fd;
+  }
+
+  static void SendRaw(const FileDescriptor& fd, const std::string& bytes) {
+    ASSERT_EQ(static_cast<ssize_t>(bytes.size()),
+              ::send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL));
+  }
+
+  static std::string Framed(const std::string& text) {
+    const uint32_t length = static_cast<uint32_t>(text.size() + 1);
+    std::string frame(reinterpret_cast<const char*>(&length), sizeof(length));
+    return frame + text + std::string(1, '\0');
+  }
+
+  // Steps the service until fd has something to read (or is closed), then
+  // reads one answer; null when the service closed the connection instead.
+  Json::Value Receive(const FileDescriptor& fd) {
+    struct pollfd pfd = {fd.get(), POLLIN, 0};
+    for (int round = 0; round < 1000 && ::poll(&pfd, 1, 0) == 0; ++round) {
+      service_->RunOnce(50);
+    }
+    if (::poll(&pfd, 1, 0) == 0) {  // never block the suite on a lost answer
+      ADD_FAILURE() << "no answer after 1000 steps of the service";
+      return Json::Value();
+    }
+    uint32_t length = 0;
+    if (::recv(fd.get(), &length, sizeof(length), MSG_WAITALL) != sizeof(length)) {
+      return Json::Value();
+    }
+    std::string body(length, '\0');
+    EXPECT_EQ(static_cast<ssize_t>(length), ::recv(fd.get(), &body[0], length, MSG_WAITALL));
+    if (!body.empty() && body.back() == '\0') body.pop_back();
+    Json::Value answer;
+    Json::CharReaderBuilder builder;
+    std::string errors;
+    std::istringstream in(body);
+    EXPECT_TRUE(Json::parseFromStream(builder, in, &answer, &errors)) << body;
+    return answer;
+  }
+
+  Json::Value Ask(const std::string& path) {
+    const FileDescriptor fd = Connect();
+    Json::Value request;
+    request["path"] = path;
+    Json::StreamWriterBuilder builder;
+    SendRaw(fd, Framed(Json::writeString(builder, request)));
+    return Receive(fd);
+  }
+
+  std::string File(const std::string& name) { return dir_.Write(name, "some text\n"); }
+
+  // A fault answer for file, then the next file through a fresh worker.
+  Json::Value ExpectFaultThenRecovery(const std::string& name) {
+    const uint64_t started = service_->workers_started();
+    const Json::Value answer = Ask(File(name));
+    EXPECT_FALSE(answer["ok"].asBool()) << answer;
+    const Json::Value next = Ask(File("after.txt"));
+    EXPECT_TRUE(next["ok"].asBool()) << next;
+    EXPECT_EQ("after.txt", next["data"]["KALOMDTitle"].asString());
+    EXPECT_EQ(started + 1, service_->workers_started());
+    EXPECT_EQ(1u, service_->live_workers());
+    return answer;
+  }
+
+  testing::TempDir dir_;
+  std::unique_ptr<ExtractService> service_;
+};
+
+TEST_F(ExtractServiceTest, SocketIsCreatedMode0660) {
+  struct stat st;
+  ASSERT_EQ(0, ::stat(dir_.Join("run/extract.sock").c_str(), &st));
+  EXPECT_TRUE(S_ISSOCK(st.st_mode));
+  EXPECT_EQ(0660u, st.st_mode & 07777);
+}
+
+TEST_F(ExtractServiceTest, AnswersWithTheParsersProperties) {
+  const Json::Value answer = Ask(File("report.txt"));
+  EXPECT_TRUE(answer["ok"].asBool()) << answer;
+  EXPECT_EQ("report.txt", answer["data"]["KALOMDTitle"].asString());
+  EXPECT_FALSE(answer.isMember("fault"));
+}
+
+TEST_F(ExtractServiceTest, CorruptFileGivesWhatWasReadAndNoFault) {
+  const Json::Value answer = Ask(File("x.bad"));
+  EXPECT_FALSE(answer["ok"].asBool());
+  EXPECT_EQ("partial", answer["data"]["KALOMDTitle"].asString());
+  EXPECT_EQ("test parser: corrupt", answer["reason"].asString());
+  EXPECT_FALSE(answer.isMember("fault"));
+}
+
+TEST_F(ExtractServiceTest, CrashingWorkerIsReplacedAndTheNextFileExtracts) {
+  const Json::Value answer = ExpectFaultThenRecovery("a.crash");
+  EXPECT_EQ("crash", answer["fault"].asString()) << answer;
+}
+
+TEST_F(ExtractServiceTest, LoopingWorkerIsKilledAtTheDeadline) {
+  const Json::Value answer = ExpectFaultThenRecovery("a.hang");
+  EXPECT_EQ("timeout", answer["fault"].asString()) << answer;
+  EXPECT_EQ("took longer than the deadline of 300 ms", answer["reason"].asString());
+}
+
+TEST_F(ExtractServiceTest, AllocatingWorkerIsStoppedAtTheMemoryCap) {
+  const Json::Value answer = ExpectFaultThenRecovery("a.hog");
+  if (!kSanitized) {
+    EXPECT_EQ("memory", answer["fault"].asString()) << answer;
+    EXPECT_EQ("exceeded the memory cap of 64 MiB", answer["reason"].asString());
+  } else {
+    EXPECT_TRUE(answer["fault"].isString()) << answer;
+  }
+}
+
+TEST_F(ExtractServiceTest, NonRegularFilesAreRefusedUnopened) {
+  const std::string fifo = dir_.Join("pipe");
+  ASSERT_EQ(0, ::mkfifo(fifo.c_str(), 0600));
+  const std::string link = dir_.Join("zero.crash");  // would crash if parsed
+  ASSERT_EQ(0, ::symlink("/dev/zero", link.c_str()));
+  for (const std::string& path : {fifo, link, std::string("/dev/zero")}) {
+    const Json::Value answer = Ask(path);
+    EXPECT_FALSE(answer["ok"].asBool()) << path;
+    EXPECT_TRUE(answer["not_regular"].asBool()) << path;
+  }
+  EXPECT_EQ(1u, service_->workers_started());
+}
+
+TEST_F(ExtractServiceTest, GarbageGetsAnErrorAndTheConnectionStaysUsable) {
+  const FileDescriptor fd = Connect();
+  SendRaw(fd, Framed("this is not json"));
+  const Json::Value answer = Receive(fd);
+  EXPECT_FALSE(answer["ok"].asBool());
+  EXPECT_EQ(0u, answer["reason"].asString().rfind("bad request", 0)) << answer;
+  SendRaw(fd, Framed("{\"path\": \"" + File("ok.txt") + "\"}"));
+  EXPECT_EQ("ok.txt", Receive(fd)["data"]["KALOMDTitle"].asString());
+}
+
+TEST_F(ExtractServiceTest, RequestsSentTogetherAreAnsweredOneByOneInOrder) {
+  const FileDescriptor fd = Connect();
+  std::string burst;
+  for (int i = 0; i < 200; ++i) burst += Framed("not json " + std::to_string(i));
+  burst += Framed("{\"path\": \"" + File("last.txt") + "\"}");
+  SendRaw(fd, burst);
+  for (int i = 0; i < 200; ++i) {
+    EXPECT_EQ(0u, Receive(fd)["reason"].asString().rfind("bad request", 0)) << i;
+  }
+  EXPECT_EQ("last.txt", Receive(fd)["data"]["KALOMDTitle"].asString());
+}
+
+TEST_F(ExtractServiceTest, HugeLengthIsRefusedAndClosedWhileOthersAreServed) {
+  const FileDescriptor liar = Connect();
+  SendRaw(liar, std::string("\xff\xff\xff\x7f", 4) + "{\"path\"");
+  const Json::Value answer = Receive(liar);
+  EXPECT_EQ("request longer than 4096 bytes", answer["reason"].asString()) << answer;
+  EXPECT_TRUE(Receive(liar).isNull());  // closed
+  EXPECT_TRUE(Ask(File("fine.txt"))["ok"].asBool());
+}
+
+TEST_F(ExtractServiceTest, StalledClientIsDroppedAndDoesNotDelayOthers) {
+  const FileDescriptor stalled = Connect();
+  SendRaw(stalled, std::string("\x20\x00", 2));  // half a length word, then nothing
+  EXPECT_TRUE(Ask(File("fine.txt"))["ok"].asBool());
+  EXPECT_TRUE(Receive(stalled).isNull());  // dropped after the idle time
+  EXPECT_EQ(0u, service_->connections());
+}
+
+TEST_F(ExtractServiceTest, ClientThatLeavesBeforeItsAnswerCostsNothing) {
+  {
+    const FileDescriptor gone = Connect();
+    SendRaw(gone, Framed("{\"path\": \"" + File("slow.hang") + "\"}"));
+    for (int round = 0; round < 3; ++round) service_->RunOnce(0);  // accept, read, dispatch
+  }
+  EXPECT_TRUE(Ask(File("next.txt"))["ok"].asBool());
+}
+
+TEST_F(ExtractServiceTest, SecondDaemonOnTheSameSocketIsRefused) {
+  ExtractServiceOptions options;
+  options.socket_path = dir_.Join("run/extract.sock");
+  ExtractService second(options, TestExtractor);
+  EXPECT_FALSE(second.Start());
+  EXPECT_EQ(EADDRINUSE, errno);
+  EXPECT_TRUE(Ask(File("still.txt"))["ok"].asBool());
+}
+
+TEST_F(ExtractServiceTest, StopRemovesTheSocketAndTheWorkers) {
+  ASSERT_EQ(1u, service_->live_workers());
+  service_->Stop();
+  EXPECT_EQ(0u, service_->live_workers());
+  EXPECT_NE(0, ::access(dir_.Join("run/extract.sock").c_str(), F_OK));
+}
+
+}  // namespace
+}  // namespace portable
+}  // namespace orvex
