@@ -6,9 +6,9 @@
 //   - the one-shot mode (`kalocontentextractd --extract PATH`): the program
 //     itself is the isolated worker for one file.
 // Both take the parsers as an Extractor. This is the daemon's own library
-// (orvex_extractd): libfileindex never links it, nor the parsers. doc/content_extraction.md describes the socket's messages
-// and the failure record.
-// ExtractService: one thread at a time. The free functions are thread-safe.
+// (orvex_extractd): libfileindex never links it, nor the parsers. doc/content_extraction.md
+// describes the socket's messages and the failure record. ExtractService: one thread at a time. The
+// free functions are thread-safe.
 #ifndef ORVEX_DAEMONS_EXTRACT_EXTRACT_SERVICE_H_
 #define ORVEX_DAEMONS_EXTRACT_EXTRACT_SERVICE_H_
 

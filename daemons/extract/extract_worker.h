@@ -10,8 +10,8 @@
 #include <string>
 #include <utility>
 
-#include "kalo/kalo_sock.h"
 #include "extract_service.h"
+#include "kalo/kalo_sock.h"
 #include "orvex/portable/file_descriptor.h"
 
 namespace orvex {

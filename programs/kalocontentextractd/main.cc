@@ -19,9 +19,9 @@
 #include <stdexcept>
 #include <string>
 
+#include "extract_service.h"
 #include "faults.h"
 #include "orvex/portable/atomic_file.h"
-#include "extract_service.h"
 #include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
 #include "orvex/version.h"

@@ -1,0 +1,24 @@
+#include "search/case_fold.h"
+
+#include <unicode/unistr.h>
+#include <unicode/uchar.h>
+
+namespace orvex {
+namespace search {
+
+std::string FoldCase(const std::string& utf8) {
+  icu::UnicodeString text = icu::UnicodeString::fromUTF8(utf8);
+  text.foldCase(U_FOLD_CASE_DEFAULT);
+  std::string out;
+  text.toUTF8String(out);
+  return out;
+}
+
+size_t CodePointCount(const std::string& utf8) {
+  size_t count = 0;
+  for (const unsigned char c : utf8) count += (c & 0xC0) != 0x80;
+  return count;
+}
+
+}  // namespace search
+}  // namespace orvex

@@ -1,0 +1,462 @@
+#include "search/index_store.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <system_error>
+
+#include "orvex/foundation/json.h"
+#include "orvex/policy/file_type.h"
+#include "search/case_fold.h"
+#include "search/search_error.h"
+
+namespace orvex {
+namespace search {
+namespace {
+
+// Bounds the write-ahead log left on disk after a checkpoint: the log of a
+// big commit would otherwise keep its peak size for good.
+constexpr int64_t kJournalSizeLimit = 64 << 20;
+
+// The schema. Text content lives in its own table, apart from the properties
+// that every listing reads. Both full-text tables are external-content
+// tables kept in step by triggers: the text is stored once.
+constexpr char kSchema[] = R"sql(
+CREATE TABLE IF NOT EXISTS meta(key TEXT PRIMARY KEY, value TEXT NOT NULL);
+CREATE TABLE IF NOT EXISTS documents(
+  id INTEGER PRIMARY KEY,
+  path TEXT NOT NULL UNIQUE,
+  parent TEXT NOT NULL,
+  name TEXT NOT NULL,
+  folded_name TEXT NOT NULL,
+  type TEXT NOT NULL,
+  extension TEXT NOT NULL,
+  is_dir INTEGER NOT NULL,
+  size INTEGER, mtime INTEGER, ctime INTEGER, crtime INTEGER,
+  owner TEXT NOT NULL,
+  body TEXT NOT NULL);
+CREATE INDEX IF NOT EXISTS documents_parent ON documents(parent);
+CREATE INDEX IF NOT EXISTS documents_type ON documents(type);
+CREATE INDEX IF NOT EXISTS documents_extension ON documents(extension);
+CREATE INDEX IF NOT EXISTS documents_size ON documents(size);
+CREATE INDEX IF NOT EXISTS documents_mtime ON documents(mtime);
+CREATE INDEX IF NOT EXISTS documents_ctime ON documents(ctime);
+CREATE INDEX IF NOT EXISTS documents_crtime ON documents(crtime);
+CREATE INDEX IF NOT EXISTS documents_owner ON documents(owner);
+CREATE INDEX IF NOT EXISTS documents_folded_name ON documents(folded_name);
+CREATE TABLE IF NOT EXISTS contents(id INTEGER PRIMARY KEY, text TEXT NOT NULL, props TEXT NOT NULL);
+CREATE VIRTUAL TABLE IF NOT EXISTS name_grams USING fts5(
+  folded_name, content='documents', content_rowid='id', tokenize='trigram case_sensitive 1');
+CREATE VIRTUAL TABLE IF NOT EXISTS words USING fts5(
+  text, props, content='contents', content_rowid='id',
+  tokenize='unicode61 remove_diacritics 2');
+CREATE TRIGGER IF NOT EXISTS documents_ai AFTER INSERT ON documents BEGIN
+  INSERT INTO name_grams(rowid, folded_name) VALUES (new.id, new.folded_name);
+END;
+CREATE TRIGGER IF NOT EXISTS documents_ad AFTER DELETE ON documents BEGIN
+  INSERT INTO name_grams(name_grams, rowid, folded_name) VALUES ('delete', old.id, old.folded_name);
+  DELETE FROM contents WHERE id = old.id;
+END;
+CREATE TRIGGER IF NOT EXISTS documents_au AFTER UPDATE OF folded_name ON documents BEGIN
+  INSERT INTO name_grams(name_grams, rowid, folded_name) VALUES ('delete', old.id, old.folded_name);
+  INSERT INTO name_grams(rowid, folded_name) VALUES (new.id, new.folded_name);
+END;
+CREATE TRIGGER IF NOT EXISTS contents_ai AFTER INSERT ON contents BEGIN
+  INSERT INTO words(rowid, text, props) VALUES (new.id, new.text, new.props);
+END;
+CREATE TRIGGER IF NOT EXISTS contents_ad AFTER DELETE ON contents BEGIN
+  INSERT INTO words(words, rowid, text, props) VALUES ('delete', old.id, old.text, old.props);
+END;
+CREATE TRIGGER IF NOT EXISTS contents_au AFTER UPDATE ON contents BEGIN
+  INSERT INTO words(words, rowid, text, props) VALUES ('delete', old.id, old.text, old.props);
+  INSERT INTO words(rowid, text, props) VALUES (new.id, new.text, new.props);
+END;
+)sql";
+
+constexpr char kColumns[] =
+    "path, parent, name, folded_name, type, extension, is_dir, size, mtime, ctime, crtime, owner, "
+    "body";
+
+// Searched as words when no schema was given: the text properties that
+// content extraction fills.
+const char* const kDefaultTextProperties[] = {
+    "KALOMDTitle",         "KALOMDAuthors",     "KALOMDAlbum",    "KALOMDCreator",
+    "KALOMDMusicalGenre",  "KALOMDComposer",    "KALOMDComment",  "KALOMDCodecs",
+    "KALOMDDescription",   "KALOMDAcquisitionMake", "KALOMDAcquisitionModel",
+    "KALOMDKeywords",      "_KALOMDUserTags",   "KALOMDSpotlightBoost"};
+
+std::string StringMember(const Json::Value& doc, const char* key) {
+  const Json::Value& v = doc[key];
+  return v.isString() ? v.asString() : std::string();
+}
+
+std::optional<int64_t> IntMember(const Json::Value& doc, const char* key) {
+  const Json::Value& v = doc[key];
+  if (v.isIntegral() || (v.isDouble() && v.isConvertibleTo(Json::intValue))) return v.asInt64();
+  return std::nullopt;
+}
+
+std::string LowerAscii(std::string text) {
+  for (char& c : text) {
+    if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
+  }
+  return text;
+}
+
+std::string ExtensionOf(const std::string& name) {
+  const size_t dot = name.rfind('.');
+  if (dot == std::string::npos || dot == 0) return std::string();
+  return LowerAscii(name.substr(dot + 1));
+}
+
+std::string TypeName(bool is_dir, const std::string& extension) {
+  if (is_dir) return "dir";
+  switch (fileindex::GetFileTypeByExtension(extension)) {
+    case fileindex::kFileTypeDocument:
+      return "document";
+    case fileindex::kFileTypeAudio:
+      return "audio";
+    case fileindex::kFileTypeVideo:
+      return "video";
+    case fileindex::kFileTypeImage:
+      return "image";
+    case fileindex::kFileTypeOther:
+      break;
+  }
+  return "other";
+}
+
+void AppendText(const Json::Value& value, std::string& out) {
+  if (value.isString()) {
+    if (!out.empty()) out += '\n';
+    out += value.asString();
+  } else if (value.isArray()) {
+    for (const Json::Value& item : value) AppendText(item, out);
+  }
+}
+
+bool TypeMatches(const std::string& type, const Json::Value& v) {
+  if (v.isNull()) return true;
+  if (type == "int") return v.isIntegral() || (v.isDouble() && v.isConvertibleTo(Json::intValue));
+  if (type == "double") return v.isNumeric();
+  if (type == "bool") return v.isBool();
+  if (v.isString()) return true;
+  if (!v.isArray()) return false;
+  return std::all_of(v.begin(), v.end(), [](const Json::Value& item) { return item.isString(); });
+}
+
+void ExecPragmas(SqliteDb& db) {
+  db.Exec("PRAGMA journal_mode=WAL");
+  // NORMAL in WAL mode: a commit survives a crash of the daemon, and only a
+  // power loss can take back the last commits, never corrupt the index.
+  db.Exec("PRAGMA synchronous=NORMAL");
+  db.Exec("PRAGMA journal_size_limit=" + std::to_string(kJournalSizeLimit));
+  db.Exec("PRAGMA busy_timeout=5000");
+}
+
+}  // namespace
+
+std::string PrefixUpperBound(const std::string& prefix) {
+  std::string bound = prefix;
+  while (!bound.empty() && static_cast<unsigned char>(bound.back()) == 0xFF) bound.pop_back();
+  if (!bound.empty()) bound.back() = static_cast<char>(bound.back() + 1);
+  return bound;
+}
+
+struct IndexStore::Row {
+  std::string path, parent, name, folded_name, type, extension, owner, body, text, props;
+  bool is_dir = false;
+  std::optional<int64_t> size, mtime, ctime, crtime;
+};
+
+struct IndexStore::Statements {
+  explicit Statements(SqliteDb& w)
+      : find(w, "SELECT id FROM documents WHERE path = ?1"),
+        load(w,
+             "SELECT d.id, d.body, c.text FROM documents d LEFT JOIN contents c ON c.id = d.id "
+             "WHERE d.path = ?1"),
+        insert(w, std::string("INSERT INTO documents(") + kColumns +
+                      ") VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11, ?12, ?13)"),
+        update(w,
+               "UPDATE documents SET path = ?1, parent = ?2, name = ?3, folded_name = ?4, "
+               "type = ?5, extension = ?6, is_dir = ?7, size = ?8, mtime = ?9, ctime = ?10, "
+               "crtime = ?11, owner = ?12, body = ?13 WHERE id = ?14"),
+        insert_content(w, "INSERT INTO contents(id, text, props) VALUES (?1, ?2, ?3)"),
+        update_content(w, "UPDATE contents SET text = ?2, props = ?3 WHERE id = ?1 AND "
+                          "(text IS NOT ?2 OR props IS NOT ?3)"),
+        remove(w, "DELETE FROM documents WHERE id = ?1"),
+        remove_prefix(w, "DELETE FROM documents WHERE path >= ?1 AND path < ?2"),
+        get_prefix(w, "SELECT body FROM documents WHERE path >= ?1 AND path < ?2 ORDER BY path"),
+        begin(w, "BEGIN IMMEDIATE"),
+        commit(w, "COMMIT"),
+        rollback(w, "ROLLBACK") {}
+  Statement find, load, insert, update, insert_content, update_content, remove, remove_prefix,
+      get_prefix, begin, commit, rollback;
+};
+
+IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
+  if (create) {
+    std::error_code ec;
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
+    if (ec) throw SearchError(kStorage, "cannot create the directory of " + path + ": " +
+                                            ec.message());
+  }
+  writer_ = std::make_unique<SqliteDb>(path, create);
+  ExecPragmas(*writer_);
+  writer_->Exec(kSchema);
+  reader_ = std::make_unique<SqliteDb>(path, /*create=*/false);
+  reader_->Exec("PRAGMA busy_timeout=5000");
+  st_ = std::make_unique<Statements>(*writer_);
+  LoadMappings();
+}
+
+IndexStore::~IndexStore() {
+  // A stop or a crash drops what was not committed: the indexer sends it
+  // again from its queue, as after kill -9.
+  if (in_transaction_) {
+    try {
+      Rollback();
+    } catch (const SearchError&) {
+    }
+  }
+  st_.reset();
+}
+
+void IndexStore::LoadMappings() {
+  types_.clear();
+  text_properties_.clear();
+  Statement get(*writer_, "SELECT value FROM meta WHERE key = 'mappings'");
+  Json::Value mappings;
+  if (!get.Step() || !fromString(mappings, get.Text(0)) || !mappings.isObject()) {
+    text_properties_.assign(std::begin(kDefaultTextProperties), std::end(kDefaultTextProperties));
+    return;
+  }
+  const Json::Value& fallback = mappings["default"];
+  const Json::Value& properties = mappings["properties"];
+  if (!properties.isObject()) return;
+  for (const std::string& name : properties.getMemberNames()) {
+    const Json::Value& own = properties[name];
+    auto member = [&](const char* key) {
+      const Json::Value& v = own.isObject() && own.isMember(key) ? own[key] : fallback[key];
+      return v.isString() ? v.asString() : std::string();
+    };
+    const std::string type = member("type").empty() ? "string" : member("type");
+    types_[name] = type;
+    const bool words = (type == "text" || type == "string") && member("analyzer") != "keyword";
+    // Text content has its own column; the search name its own index.
+    if (words && name != "KALOMDTextContent" && name != "KALOMDSearchFileName") {
+      text_properties_.push_back(name);
+    }
+  }
+}
+
+void IndexStore::SetMappings(const Json::Value& mappings) {
+  Begin();
+  Statement put(*writer_, "INSERT OR REPLACE INTO meta(key, value) VALUES ('mappings', ?1)");
+  put.Bind(1, toString(mappings)).Run();
+  LoadMappings();
+}
+
+void IndexStore::Begin() {
+  if (in_transaction_) return;
+  st_->begin.Run();
+  in_transaction_ = true;
+}
+
+void IndexStore::Commit() {
+  if (!in_transaction_) return;
+  st_->commit.Run();
+  in_transaction_ = false;
+}
+
+void IndexStore::Rollback() {
+  if (!in_transaction_) return;
+  in_transaction_ = false;
+  st_->rollback.Run();
+}
+
+void IndexStore::CheckTypes(const Json::Value& doc) const {
+  for (const std::string& name : doc.getMemberNames()) {
+    const auto it = types_.find(name);
+    if (it != types_.end() && !TypeMatches(it->second, doc[name])) {
+      throw SearchError(kBadArgument, "property " + name + " must be of type " + it->second +
+                                          ", not " + toString(doc[name]));
+    }
+  }
+  if (doc.isMember("KALOMDPath") && !doc["KALOMDPath"].isString()) {
+    throw SearchError(kBadArgument, "property KALOMDPath must be a string");
+  }
+}
+
+std::optional<int64_t> IndexStore::FindId(const std::string& path) {
+  Statement& find = st_->find;
+  find.Bind(1, path);
+  std::optional<int64_t> id;
+  if (find.Step()) id = find.Int(0);
+  find.Reset();
+  return id;
+}
+
+IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, Json::Value doc) const {
+  // Reads go through a const reference: a missing member must not be added
+  // to the stored document as null.
+  const Json::Value& view = doc;
+  Row row;
+  row.path = view["KALOMDPath"].isString() ? view["KALOMDPath"].asString() : doc_id;
+  doc["KALOMDPath"] = row.path;
+  const size_t slash = row.path.rfind('/');
+  row.name = StringMember(view, "KALOMDFSName");
+  if (row.name.empty()) row.name = slash == std::string::npos ? row.path : row.path.substr(slash + 1);
+  row.parent = StringMember(view, "KALOMDParent");
+  if (row.parent.empty() && slash != std::string::npos) row.parent = row.path.substr(0, slash);
+  std::string search_name = StringMember(view, "KALOMDSearchFileName");
+  if (search_name.empty()) search_name = row.name;
+  row.folded_name = FoldCase(search_name);
+  row.extension = view["KALOMDExtension"].isString() ? LowerAscii(view["KALOMDExtension"].asString())
+                                                    : ExtensionOf(row.name);
+  row.is_dir = view["KALOMDIsDir"].isBool() && view["KALOMDIsDir"].asBool();
+  row.type = TypeName(row.is_dir, row.extension);
+  row.size = IntMember(view, "KALOMDFSSize");
+  row.mtime = IntMember(view, "KALOMDFSContentChangeDate");
+  row.ctime = IntMember(view, "KALOMDAttributeChangeDate");
+  row.crtime = IntMember(view, "KALOMDFSCreationDate");
+  const Json::Value& owner = view["KALOMDOwnerUserID"];
+  row.owner = owner.isString() ? owner.asString()
+              : owner.isIntegral() ? std::to_string(owner.asInt64())
+                                   : std::string();
+  row.text = StringMember(view, "KALOMDTextContent");
+  doc.removeMember("KALOMDTextContent");
+  for (const std::string& name : text_properties_) AppendText(view[name], row.props);
+  row.body = toString(doc);
+  return row;
+}
+
+namespace {
+
+void BindOptional(Statement& s, int index, const std::optional<int64_t>& v) {
+  if (v) {
+    s.Bind(index, *v);
+  } else {
+    s.BindNull(index);
+  }
+}
+
+void BindRow(Statement& s, const std::string& path, const std::string& parent,
+             const std::string& name, const std::string& folded, const std::string& type,
+             const std::string& extension, bool is_dir) {
+  s.Bind(1, path).Bind(2, parent).Bind(3, name).Bind(4, folded).Bind(5, type).Bind(6, extension);
+  s.Bind(7, int64_t{is_dir});
+}
+
+}  // namespace
+
+void IndexStore::Insert(const Row& row) {
+  Statement& s = st_->insert;
+  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
+  BindOptional(s, 8, row.size);
+  BindOptional(s, 9, row.mtime);
+  BindOptional(s, 10, row.ctime);
+  BindOptional(s, 11, row.crtime);
+  s.Bind(12, row.owner).Bind(13, row.body).Run();
+  st_->insert_content.Bind(1, writer_->LastInsertRowid()).Bind(2, row.text).Bind(3, row.props);
+  st_->insert_content.Run();
+}
+
+void IndexStore::Update(int64_t id, const Row& row) {
+  Statement& s = st_->update;
+  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
+  BindOptional(s, 8, row.size);
+  BindOptional(s, 9, row.mtime);
+  BindOptional(s, 10, row.ctime);
+  BindOptional(s, 11, row.crtime);
+  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, id).Run();
+  // Only when the words changed: a rename must not re-index a book's text.
+  st_->update_content.Bind(1, id).Bind(2, row.text).Bind(3, row.props).Run();
+}
+
+void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc) {
+  CheckTypes(doc);
+  const Row row = MakeRow(doc_id, doc);
+  Begin();
+  if (const auto id = FindId(doc_id)) st_->remove.Bind(1, *id).Run();
+  if (row.path != doc_id) {
+    if (const auto id = FindId(row.path)) st_->remove.Bind(1, *id).Run();
+  }
+  Insert(row);
+}
+
+void IndexStore::Set(const std::string& doc_id, const Json::Value& changes) {
+  CheckTypes(changes);
+  Begin();
+  Statement& load = st_->load;
+  load.Bind(1, doc_id);
+  if (!load.Step()) {
+    load.Reset();
+    throw SearchError(kNoSuchDocument, "no document " + doc_id);
+  }
+  const int64_t id = load.Int(0);
+  Json::Value doc;
+  const bool parsed = fromString(doc, load.Text(1));
+  const std::string text = load.Text(2);
+  load.Reset();
+  if (!parsed || !doc.isObject()) throw SearchError(kStorage, "unreadable document " + doc_id);
+  if (!text.empty()) doc["KALOMDTextContent"] = text;
+  for (const std::string& name : changes.getMemberNames()) doc[name] = changes[name];
+  const Row row = MakeRow(doc_id, doc);
+  if (row.path != doc_id) {
+    if (const auto other = FindId(row.path)) st_->remove.Bind(1, *other).Run();
+  }
+  Update(id, row);
+}
+
+bool IndexStore::Delete(const std::string& doc_id) {
+  Begin();
+  const auto id = FindId(doc_id);
+  if (id) st_->remove.Bind(1, *id).Run();
+  return id.has_value();
+}
+
+int64_t IndexStore::DeleteByPrefix(const std::string& prefix) {
+  Begin();
+  st_->remove_prefix.Bind(1, prefix).Bind(2, PrefixUpperBound(prefix)).Run();
+  return writer_->Changes();
+}
+
+Json::Value IndexStore::GetByPrefix(const std::string& prefix) {
+  Json::Value out(Json::arrayValue);
+  Statement& get = st_->get_prefix;
+  get.Bind(1, prefix).Bind(2, PrefixUpperBound(prefix));
+  while (get.Step()) {
+    Json::Value doc;
+    if (fromString(doc, get.Text(0))) out.append(std::move(doc));
+  }
+  get.Reset();
+  return out;
+}
+
+Json::Value IndexStore::Stats() {
+  Json::Value out;
+  Statement count(*reader_, "SELECT count(*) FROM documents");
+  count.Step();
+  out["documents"] = static_cast<Json::Int64>(count.Int(0));
+  int64_t bytes = 0;
+  for (const char* suffix : {"", "-wal"}) {
+    struct stat st;
+    if (::stat((path_ + suffix).c_str(), &st) == 0) bytes += st.st_size;
+  }
+  out["bytes"] = static_cast<Json::Int64>(bytes);
+  out["uncommitted"] = in_transaction_;
+  return out;
+}
+
+void IndexStore::Close() {
+  Commit();
+  st_.reset();
+  reader_.reset();
+  writer_->Exec("PRAGMA wal_checkpoint(TRUNCATE)");
+  writer_.reset();
+}
+
+}  // namespace search
+}  // namespace orvex

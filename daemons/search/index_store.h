@@ -1,0 +1,130 @@
+// IndexStore: one search index, kept in one SQLite database (layout in
+// doc/search_protocol.md). Documents are identified by their KALOMDPath. Two
+// connections: the writer holds one open transaction from the first change
+// to Commit(), and the reader, used for user searches, sees only what was
+// committed. One thread at a time.
+#ifndef ORVEX_SEARCH_INDEX_STORE_H_
+#define ORVEX_SEARCH_INDEX_STORE_H_
+
+#include <json/json.h>
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "search/sqlite_db.h"
+
+namespace orvex {
+namespace search {
+
+// What a user search asks for. Empty strings and unset bounds do not filter.
+struct SearchQuery {
+  std::string name;       // a fragment of the file name, any case
+  std::string text;       // words, "phrases" and prefix* over text and text properties
+  std::string type;       // "dir", "document", "audio", "video", "image" or "other"
+  std::string extension;  // without its dot, any case
+  std::optional<int64_t> size_min, size_max;
+  std::optional<int64_t> mtime_min, mtime_max;  // KALOMDFSContentChangeDate
+  std::string folder;     // only documents below this full path
+  std::string owner;      // only documents of this user id (permission trimming)
+  std::string sort = "name";  // "name", "path", "size", "mtime" or "relevance"
+  bool descending = false;
+  int64_t offset = 0;
+  int64_t limit = 50;
+};
+
+struct SearchHit {
+  std::string path, name, type;
+  std::string folded_name;  // the name order's key, for merging indexes
+  bool is_dir = false;
+  std::optional<int64_t> size, mtime, ctime, crtime;
+  std::string owner;
+  std::string snippet;  // text around the matched words; empty without a text query
+  double rank = 0;      // lower is better (FTS5's bm25)
+};
+
+struct SearchResult {
+  int64_t total = 0;
+  std::vector<SearchHit> hits;
+};
+
+class IndexStore {
+ public:
+  // Opens the database at path, creating it (and its directory) when create
+  // is true. Throws SearchError: kStorage when it cannot.
+  IndexStore(const std::string& path, bool create);
+  IndexStore(const IndexStore&) = delete;
+  IndexStore& operator=(const IndexStore&) = delete;
+  ~IndexStore();
+
+  // Keeps the schema sent with "index_create": its property types are then
+  // checked on every write. Part of the next commit.
+  void SetMappings(const Json::Value& mappings);
+
+  // Replaces (or adds) the document doc_id with doc. Throws kBadArgument when
+  // a property has the wrong type.
+  void Upsert(const std::string& doc_id, const Json::Value& doc);
+  // Sets the members of changes in document doc_id, keeping the others; a new
+  // KALOMDPath moves the document (replacing any other at that path). Throws
+  // kNoSuchDocument when there is no such document.
+  void Set(const std::string& doc_id, const Json::Value& changes);
+  // False when there was no such document.
+  bool Delete(const std::string& doc_id);
+  // Deletes every document whose KALOMDPath begins with prefix; their count.
+  int64_t DeleteByPrefix(const std::string& prefix);
+  // The documents whose KALOMDPath begins with prefix, in path order, as
+  // stored (without their text content). Sees uncommitted changes.
+  Json::Value GetByPrefix(const std::string& prefix);
+
+  // Makes every change since the last commit durable and visible to searches.
+  void Commit();
+  // Drops the changes since the last commit.
+  void Rollback();
+  bool InTransaction() const { return in_transaction_; }
+
+  // Up to offset + limit best hits by the query's order (the caller slices:
+  // hits of several indexes are merged first), and the total count. Only
+  // committed documents.
+  SearchResult Search(const SearchQuery& query);
+
+  // Document count, committed, and the database's size in bytes.
+  Json::Value Stats();
+
+  // Commits, then folds the write-ahead log into the database file and
+  // closes: afterwards the one file at path() is the whole index.
+  void Close();
+
+  const std::string& path() const { return path_; }
+
+ private:
+  struct Row;
+  struct Statements;
+
+  void Begin();
+  void CheckTypes(const Json::Value& doc) const;
+  std::optional<int64_t> FindId(const std::string& path);
+  Row MakeRow(const std::string& doc_id, Json::Value doc) const;
+  void Insert(const Row& row);
+  void Update(int64_t id, const Row& row);
+  void LoadMappings();
+
+  std::string path_;
+  std::unique_ptr<SqliteDb> writer_;
+  std::unique_ptr<SqliteDb> reader_;
+  std::unique_ptr<Statements> st_;
+  bool in_transaction_ = false;
+  std::map<std::string, std::string> types_;   // property -> "int", "double", "bool", "string", "text"
+  std::vector<std::string> text_properties_;   // those searched as words
+};
+
+// The smallest string greater than every string that begins with prefix,
+// for range scans on the path index; empty when there is none.
+std::string PrefixUpperBound(const std::string& prefix);
+
+}  // namespace search
+}  // namespace orvex
+
+#endif  // ORVEX_SEARCH_INDEX_STORE_H_

@@ -1,0 +1,443 @@
+#include "search/search_engine.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+#include "search/search_error.h"
+#include "search/store_files.h"
+#include "search/viewer.h"
+
+namespace orvex {
+namespace search {
+namespace {
+
+constexpr int64_t kMaxLimit = 1000;
+
+const Json::Value& Member(const Json::Value& data, const char* key) {
+  if (!data.isMember(key)) throw SearchError(kBadArgument, std::string("missing \"") + key + "\"");
+  return data[key];
+}
+
+std::string StringArg(const Json::Value& data, const char* key) {
+  const Json::Value& v = Member(data, key);
+  if (!v.isString()) throw SearchError(kBadArgument, std::string("\"") + key + "\" must be a string");
+  return v.asString();
+}
+
+const Json::Value& ObjectArg(const Json::Value& data, const char* key) {
+  const Json::Value& v = Member(data, key);
+  if (!v.isObject()) throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an object");
+  return v;
+}
+
+std::string AbsolutePathArg(const Json::Value& data, const char* key) {
+  const std::string path = StringArg(data, key);
+  if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
+    throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an absolute path");
+  }
+  return path;
+}
+
+// {"qsl": {"prefix": {"KALOMDPath": prefix}}}: the one query the indexer sends.
+std::string PrefixQueryArg(const Json::Value& data) {
+  const Json::Value& query = ObjectArg(data, "query");
+  const Json::Value& qsl = ObjectArg(query, "qsl");
+  const Json::Value& prefix = ObjectArg(qsl, "prefix");
+  const std::string path = StringArg(prefix, "KALOMDPath");
+  // An empty prefix would reach every document of the index.
+  if (path.empty()) throw SearchError(kBadArgument, "the prefix must not be empty");
+  return path;
+}
+
+std::optional<int64_t> OptionalIntArg(const Json::Value& data, const char* key) {
+  if (!data.isMember(key) || data[key].isNull()) return std::nullopt;
+  if (!data[key].isIntegral()) {
+    throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an integer");
+  }
+  return data[key].asInt64();
+}
+
+std::string OptionalStringArg(const Json::Value& data, const char* key) {
+  if (!data.isMember(key) || data[key].isNull()) return std::string();
+  return StringArg(data, key);
+}
+
+SearchQuery ParseQuery(const Json::Value& data) {
+  SearchQuery q;
+  q.name = OptionalStringArg(data, "name");
+  q.text = OptionalStringArg(data, "text");
+  q.type = OptionalStringArg(data, "type");
+  q.extension = OptionalStringArg(data, "extension");
+  q.folder = OptionalStringArg(data, "folder");
+  q.size_min = OptionalIntArg(data, "size_min");
+  q.size_max = OptionalIntArg(data, "size_max");
+  q.mtime_min = OptionalIntArg(data, "mtime_min");
+  q.mtime_max = OptionalIntArg(data, "mtime_max");
+  const std::string sort = OptionalStringArg(data, "sort");
+  if (!sort.empty()) {
+    static const char* const kSorts[] = {"name", "path", "size", "mtime", "relevance"};
+    if (std::find(std::begin(kSorts), std::end(kSorts), sort) == std::end(kSorts)) {
+      throw SearchError(kBadArgument, "unknown sort \"" + sort + "\"");
+    }
+    q.sort = sort;
+  }
+  const std::string order = OptionalStringArg(data, "order");
+  if (!order.empty() && order != "asc" && order != "desc") {
+    throw SearchError(kBadArgument, "\"order\" must be \"asc\" or \"desc\"");
+  }
+  q.descending = order == "desc";
+  q.offset = OptionalIntArg(data, "offset").value_or(0);
+  q.limit = OptionalIntArg(data, "limit").value_or(50);
+  if (q.offset < 0 || q.limit < 0 || q.limit > kMaxLimit) {
+    throw SearchError(kBadArgument, "\"offset\" must be >= 0 and \"limit\" 0 to " +
+                                        std::to_string(kMaxLimit));
+  }
+  return q;
+}
+
+// The merge order of hits from several indexes: the order each index used.
+bool Before(const SearchHit& a, const SearchHit& b, const SearchQuery& q) {
+  auto by = [&](auto key_a, auto key_b) {
+    if (key_a != key_b) return q.descending ? key_b < key_a : key_a < key_b;
+    return a.path < b.path;
+  };
+  if (q.sort == "relevance" && !q.text.empty()) return by(a.rank, b.rank);
+  if (q.sort == "path") return by(a.path, b.path);
+  if (q.sort == "size") return by(a.size.value_or(-1), b.size.value_or(-1));
+  if (q.sort == "mtime") return by(a.mtime.value_or(-1), b.mtime.value_or(-1));
+  return by(a.folded_name, b.folded_name);
+}
+
+Json::Value HitJson(const SearchHit& hit, const std::string& id) {
+  Json::Value out;
+  out["id"] = id;
+  out["path"] = hit.path;
+  out["name"] = hit.name;
+  out["type"] = hit.type;
+  out["is_dir"] = hit.is_dir;
+  auto put = [&](const char* key, const std::optional<int64_t>& v) {
+    if (v) out[key] = static_cast<Json::Int64>(*v);
+  };
+  put("size", hit.size);
+  put("mtime", hit.mtime);
+  put("ctime", hit.ctime);
+  put("crtime", hit.crtime);
+  out["owner"] = hit.owner;
+  if (!hit.snippet.empty()) out["snippet"] = hit.snippet;
+  return out;
+}
+
+// The hits of store that viewer may read: pages grow until the page asked for
+// is full or the matches run out. "total" is exact when they ran out, and
+// otherwise counts the unread matches beyond the last page fetched.
+SearchResult ReadableHits(IndexStore& store, const SearchQuery& q, const Viewer& viewer) {
+  const int64_t need = q.offset + q.limit;
+  SearchQuery page = q;
+  page.offset = 0;
+  page.limit = std::max<int64_t>(need, 16);
+  for (;;) {
+    SearchResult result = store.Search(page);
+    const int64_t fetched = static_cast<int64_t>(result.hits.size());
+    const auto unreadable = std::remove_if(result.hits.begin(), result.hits.end(),
+                                           [&](const SearchHit& hit) { return !CanRead(hit.path, viewer); });
+    const int64_t hidden = result.hits.end() - unreadable;
+    result.hits.erase(unreadable, result.hits.end());
+    const bool exhausted = fetched < page.limit;
+    if (exhausted || static_cast<int64_t>(result.hits.size()) >= need) {
+      result.total -= hidden;
+      return result;
+    }
+    page.limit *= 4;
+  }
+}
+
+}  // namespace
+
+std::string CheckIndexId(const Json::Value& id) {
+  if (!id.isString()) throw SearchError(kBadArgument, "\"id\" must be a string");
+  const std::string text = id.asString();
+  if (text.empty() || text.find('/') != std::string::npos ||
+      text.find("..") != std::string::npos || text.find('\0') != std::string::npos) {
+    throw SearchError(kBadIndexId, "bad index id \"" + text + "\": empty, or holds / or ..");
+  }
+  return text;
+}
+
+SearchEngine::SearchEngine(const std::string& registry_file) : registry_(registry_file) {}
+
+SearchEngine::~SearchEngine() = default;
+
+Json::Value SearchEngine::ErrorAnswer(int code, const std::string& msg) {
+  Json::Value answer;
+  answer["success"] = false;
+  answer["error"]["code"] = code;
+  answer["error"]["msg"] = msg;
+  return answer;
+}
+
+Json::Value SearchEngine::Handle(const Json::Value& request, const Caller& caller) {
+  try {
+    if (!request.isObject()) throw SearchError(kBadJson, "the request is not a JSON object");
+    if (request.isMember("compound")) return Compound(request["compound"], caller);
+    return Dispatch(request, caller);
+  } catch (const SearchError& e) {
+    return ErrorAnswer(e.code(), e.what());
+  } catch (const std::exception& e) {
+    // jsoncpp's type errors and allocation failures: the daemon goes on.
+    return ErrorAnswer(kStorage, e.what());
+  }
+}
+
+Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& caller) {
+  if (!items.isArray()) throw SearchError(kBadArgument, "\"compound\" must be an array");
+  Json::Value answer;
+  answer["success"] = true;
+  answer["has_fail"] = false;
+  answer["data"] = Json::Value(Json::arrayValue);
+  for (const Json::Value& item : items) {
+    Json::Value result;
+    if (item.isObject() && item.isMember("compound")) {
+      result = ErrorAnswer(kBadArgument, "a compound request cannot hold another");
+    } else {
+      result = Handle(item, caller);
+    }
+    if (!result["success"].asBool()) answer["has_fail"] = true;
+    answer["data"].append(std::move(result));
+  }
+  return answer;
+}
+
+Json::Value SearchEngine::Dispatch(const Json::Value& request, const Caller& caller) {
+  const std::string command = StringArg(request, "command");
+  const Json::Value& data = ObjectArg(request, "data");
+  Json::Value answer;
+  if (command == "index_create") {
+    answer = IndexCreate(data);
+  } else if (command == "index_delete") {
+    answer = IndexDelete(data);
+  } else if (command == "index_pause") {
+    answer = IndexPause(data, /*paused=*/true);
+  } else if (command == "index_resume") {
+    answer = IndexPause(data, /*paused=*/false);
+  } else if (command == "index_config_set") {
+    answer = IndexConfigSet(data);
+  } else if (command == "document_upsert_by_id") {
+    answer = DocumentWrite(data, /*merge=*/false);
+  } else if (command == "document_set_by_id") {
+    answer = DocumentWrite(data, /*merge=*/true);
+  } else if (command == "document_del_by_id") {
+    answer = DocumentDelete(data);
+  } else if (command == "document_del_by_query") {
+    answer = DocumentQuery(data, /*remove=*/true);
+  } else if (command == "document_get_by_query") {
+    answer = DocumentQuery(data, /*remove=*/false);
+  } else if (command == "commit") {
+    answer = Commit(data);
+  } else if (command == "search") {
+    answer = Search(data, caller);
+  } else if (command == "stats") {
+    answer = Stats(data);
+  } else {
+    throw SearchError(kUnknownCommand, "unknown command \"" + command + "\"");
+  }
+  answer["success"] = true;
+  return answer;
+}
+
+IndexStore& SearchEngine::Store(const std::string& id) {
+  const auto it = open_.find(id);
+  if (it != open_.end()) return *it->second;
+  const IndexRecord* record = registry_.Find(id);
+  if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
+  // create: a database lost from under a registered index (a volume
+  // replaced) comes back empty and the indexer fills it again.
+  auto store = std::make_unique<IndexStore>(record->path, /*create=*/true);
+  return *(open_[id] = std::move(store));
+}
+
+void SearchEngine::CloseStore(const std::string& id) {
+  const auto it = open_.find(id);
+  if (it == open_.end()) return;
+  it->second->Close();
+  open_.erase(it);
+}
+
+Json::Value SearchEngine::IndexCreate(const Json::Value& data) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const std::string path = AbsolutePathArg(data, "path");
+  if (data.isMember("mappings") && !data["mappings"].isObject()) {
+    throw SearchError(kBadArgument, "\"mappings\" must be an object");
+  }
+  for (const auto& [other, record] : registry_.indexes()) {
+    if (other == id && record.path != path) {
+      throw SearchError(kIndexExists, "index \"" + id + "\" exists at " + record.path);
+    }
+    if (other != id && record.path == path) {
+      throw SearchError(kIndexExists, path + " is the database of index \"" + other + "\"");
+    }
+  }
+  if (registry_.Find(id) == nullptr) {
+    // The database first: a registered index always has one.
+    auto store = std::make_unique<IndexStore>(path, /*create=*/true);
+    registry_.Put(id, {path, false});
+    open_[id] = std::move(store);
+  }
+  if (data.isMember("mappings")) {
+    IndexStore& store = Store(id);
+    store.SetMappings(data["mappings"]);
+    store.Commit();
+  }
+  return Json::Value(Json::objectValue);
+}
+
+Json::Value SearchEngine::IndexDelete(const Json::Value& data) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const IndexRecord* record = registry_.Find(id);
+  // Deleting what is not there is done: a repeated request must not fail.
+  if (record == nullptr) return Json::Value(Json::objectValue);
+  const std::string path = record->path;
+  open_.erase(id);  // rolls back what was not committed
+  registry_.Remove(id);
+  RemoveStoreFiles(path);
+  return Json::Value(Json::objectValue);
+}
+
+Json::Value SearchEngine::IndexPause(const Json::Value& data, bool paused) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const IndexRecord* record = registry_.Find(id);
+  if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
+  if (record->paused != paused) registry_.Put(id, {record->path, paused});
+  return Json::Value(Json::objectValue);
+}
+
+// A rename (new id and path) or a move (new path): the database moves whole,
+// committed and with its log folded in, by one rename where the volume allows.
+Json::Value SearchEngine::IndexConfigSet(const Json::Value& data) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const Json::Value& change = ObjectArg(data, "data");
+  const IndexRecord* record = registry_.Find(id);
+  if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
+  const std::string new_id = change.isMember("id") ? CheckIndexId(change["id"]) : id;
+  const std::string new_path = change.isMember("path") ? AbsolutePathArg(change, "path")
+                                                       : record->path;
+  if (new_id != id && registry_.Find(new_id) != nullptr) {
+    throw SearchError(kIndexExists, "index \"" + new_id + "\" exists");
+  }
+  for (const auto& [other, other_record] : registry_.indexes()) {
+    if (other != id && other_record.path == new_path) {
+      throw SearchError(kIndexExists, new_path + " is the database of index \"" + other + "\"");
+    }
+  }
+  const IndexRecord moved{new_path, record->paused};
+  const std::string old_path = record->path;
+  CloseStore(id);
+  if (new_path != old_path) MoveStoreFile(old_path, new_path);
+  if (new_id != id) {
+    registry_.Put(new_id, moved);
+    registry_.Remove(id);
+  } else {
+    registry_.Put(id, moved);
+  }
+  return Json::Value(Json::objectValue);
+}
+
+Json::Value SearchEngine::DocumentWrite(const Json::Value& data, bool merge) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const std::string doc_id = StringArg(data, "doc_id");
+  if (doc_id.empty()) throw SearchError(kBadArgument, "\"doc_id\" must not be empty");
+  const Json::Value& doc = ObjectArg(data, "data");
+  IndexStore& store = Store(id);
+  if (merge) {
+    store.Set(doc_id, doc);
+  } else {
+    store.Upsert(doc_id, doc);
+  }
+  return Json::Value(Json::objectValue);
+}
+
+Json::Value SearchEngine::DocumentDelete(const Json::Value& data) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const std::string doc_id = StringArg(data, "doc_id");
+  Json::Value answer;
+  answer["data"]["deleted"] = Store(id).Delete(doc_id) ? 1 : 0;
+  return answer;
+}
+
+Json::Value SearchEngine::DocumentQuery(const Json::Value& data, bool remove) {
+  const std::string id = CheckIndexId(Member(data, "id"));
+  const std::string prefix = PrefixQueryArg(data);
+  IndexStore& store = Store(id);
+  Json::Value answer;
+  if (remove) {
+    answer["data"]["deleted"] = static_cast<Json::Int64>(store.DeleteByPrefix(prefix));
+  } else {
+    answer["data"] = store.GetByPrefix(prefix);
+  }
+  return answer;
+}
+
+Json::Value SearchEngine::Commit(const Json::Value& data) {
+  Store(CheckIndexId(Member(data, "id"))).Commit();
+  return Json::Value(Json::objectValue);
+}
+
+Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) {
+  SearchQuery q = ParseQuery(data);
+  std::vector<std::string> ids;
+  if (data.isMember("id")) {
+    ids.push_back(CheckIndexId(data["id"]));
+    if (registry_.Find(ids[0]) == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + ids[0] + "\"");
+  } else {
+    for (const auto& entry : registry_.indexes()) ids.push_back(entry.first);
+  }
+  const Viewer viewer = ResolveViewer(data, caller);
+  std::vector<std::pair<SearchHit, std::string>> hits;
+  int64_t total = 0;
+  for (const std::string& id : ids) {
+    const Visibility visibility = IndexVisibility(id, viewer);
+    if (visibility == Visibility::kNone) continue;
+    SearchResult result = visibility == Visibility::kAll ? Store(id).Search(q)
+                                                         : ReadableHits(Store(id), q, viewer);
+    total += result.total;
+    for (SearchHit& hit : result.hits) hits.emplace_back(std::move(hit), id);
+  }
+  std::stable_sort(hits.begin(), hits.end(),
+                   [&](const auto& a, const auto& b) { return Before(a.first, b.first, q); });
+  Json::Value answer;
+  answer["data"]["total"] = static_cast<Json::Int64>(total);
+  answer["data"]["hits"] = Json::Value(Json::arrayValue);
+  const size_t begin = std::min(hits.size(), static_cast<size_t>(q.offset));
+  const size_t end = std::min(hits.size(), begin + static_cast<size_t>(q.limit));
+  for (size_t i = begin; i < end; ++i) {
+    answer["data"]["hits"].append(HitJson(hits[i].first, hits[i].second));
+  }
+  return answer;
+}
+
+Json::Value SearchEngine::Stats(const Json::Value& data) {
+  Json::Value answer;
+  answer["data"]["indexes"] = Json::Value(Json::arrayValue);
+  const std::string only = data.isMember("id") ? CheckIndexId(data["id"]) : std::string();
+  if (!only.empty() && registry_.Find(only) == nullptr) {
+    throw SearchError(kNoSuchIndex, "no index \"" + only + "\"");
+  }
+  for (const auto& [id, record] : registry_.indexes()) {
+    if (!only.empty() && id != only) continue;
+    Json::Value entry = Store(id).Stats();
+    entry["id"] = id;
+    entry["path"] = record.path;
+    entry["paused"] = record.paused;
+    answer["data"]["indexes"].append(std::move(entry));
+  }
+  return answer;
+}
+
+}  // namespace search
+}  // namespace orvex
