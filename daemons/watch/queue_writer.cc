@@ -1,13 +1,12 @@
 #include "watch/queue_writer.h"
 
 #include <fcntl.h>
+#include <json/json.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
-
-#include <json/json.h>
 
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"

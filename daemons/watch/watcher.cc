@@ -39,15 +39,13 @@ constexpr int kMovePairWaitMs = 10;
 // The platform's per-directory metadata folders: never watched, never told.
 constexpr char kMetadataDir[] = "@eaDir";
 
-#define WATCH_LOG(format, ...)                                                              \
-  ::orvex::LogPlain("%s:%d (%d, %u) " format, "watcher", __LINE__,                         \
-                    static_cast<int>(::getpid()), static_cast<unsigned>(::geteuid()), \
-                    __VA_ARGS__)
+#define WATCH_LOG(format, ...)                                                                   \
+  ::orvex::LogPlain("%s:%d (%d, %u) " format, "watcher", __LINE__, static_cast<int>(::getpid()), \
+                    static_cast<unsigned>(::geteuid()), __VA_ARGS__)
 
 bool IsUnder(const std::string& path, const std::string& top) {
-  return path == top ||
-         (path.size() > top.size() && path.compare(0, top.size(), top) == 0 &&
-          path[top.size()] == '/');
+  return path == top || (path.size() > top.size() && path.compare(0, top.size(), top) == 0 &&
+                         path[top.size()] == '/');
 }
 
 bool IsDirectory(const std::string& path) {
@@ -100,6 +98,15 @@ bool Watcher::Start(std::string& why) {
 // ---------------------------------------------------------------- registry
 
 void Watcher::ResyncRegistry() {
+  // Made again if it was removed: a registry directory that came back is
+  // watched again at the next resync.
+  const bool watched = std::any_of(registry_wds_.begin(), registry_wds_.end(), [&](const auto& wd) {
+    return wd.second == options_.registry_dir;
+  });
+  if (!watched && MakeDirs(options_.registry_dir)) {
+    const int wd = registry_.AddWatch(options_.registry_dir, kRegistryMask);
+    if (wd >= 0) registry_wds_[wd] = options_.registry_dir;
+  }
   // Application directories are watched before their files are read, so a
   // registration written meanwhile is either read now or reported later.
   std::unique_ptr<DIR, int (*)(DIR*)> d(::opendir(options_.registry_dir.c_str()), ::closedir);
@@ -149,8 +156,7 @@ void Watcher::DrainRegistryEvents() {
 }
 
 void Watcher::AddRegistration(const std::string& file, const Registration& reg) {
-  const std::string fallback =
-      reg.folders.empty() ? Parent(reg.queue) : reg.folders.front().path;
+  const std::string fallback = reg.folders.empty() ? Parent(reg.queue) : reg.folders.front().path;
   const std::string crash_path = CrashMarkPath(reg.queue, fallback);
   std::vector<int> old = roots_of_[file];
   std::vector<int> kept;
@@ -179,8 +185,8 @@ void Watcher::RemoveRegistration(const std::string& file) {
   registrations_.erase(file);
 }
 
-int Watcher::AddRoot(const std::string& file, const std::string& queue,
-                     const WatchedFolder& folder, const std::string& crash_path) {
+int Watcher::AddRoot(const std::string& file, const std::string& queue, const WatchedFolder& folder,
+                     const std::string& crash_path) {
   const int id = next_root_id_++;
   Root& root = roots_[id];
   root.registration = file;
@@ -249,7 +255,9 @@ void Watcher::WatchTree(const std::set<int>& roots, const std::string& top, bool
 }
 
 int Watcher::WatchOne(const std::set<int>& roots, const std::string& dir) {
-  const int wd = events_.AddWatch(dir, kDirMask);
+  const int fault = options_.watch_fault ? options_.watch_fault(dir) : 0;
+  if (fault != 0) errno = fault;
+  const int wd = fault != 0 ? -1 : events_.AddWatch(dir, kDirMask);
   if (wd < 0) {
     if (errno == ENOSPC) {
       WatchLimitReached(roots, dir);
@@ -284,13 +292,17 @@ void Watcher::DropRootFromTree(int id, const std::string& top) {
   }
 }
 
-void Watcher::UnwatchTree(const std::string& top) {
+std::vector<int> Watcher::WatchesUnder(const std::string& top) const {
   std::vector<int> wds;
   for (auto it = dir_by_path_.lower_bound(top); it != dir_by_path_.end(); ++it) {
     if (it->first.compare(0, top.size(), top) != 0) break;  // past every "top..." name
     if (IsUnder(it->first, top)) wds.push_back(it->second);
   }
-  for (int wd : wds) {
+  return wds;
+}
+
+void Watcher::UnwatchTree(const std::string& top) {
+  for (int wd : WatchesUnder(top)) {
     events_.RemoveWatch(wd);
     EraseDir(wd);
   }
@@ -359,8 +371,8 @@ size_t Watcher::RunOnce(int timeout_ms) {
         next_retry_ - std::chrono::steady_clock::now());
     timeout_ms = std::max<int>(0, std::min<long long>(timeout_ms, left.count()));
   }
-  struct pollfd fds[3] = {{events_.fd(), POLLIN, 0}, {registry_.fd(), POLLIN, 0},
-                          {wake_fd_, POLLIN, 0}};
+  struct pollfd fds[3] = {
+      {events_.fd(), POLLIN, 0}, {registry_.fd(), POLLIN, 0}, {wake_fd_, POLLIN, 0}};
   const int nfds = wake_fd_ >= 0 ? 3 : 2;
   if (::poll(fds, nfds, timeout_ms) > 0 && nfds == 3 && (fds[2].revents & POLLIN)) woken_ = true;
   errno = 0;
@@ -510,8 +522,8 @@ void Watcher::Rename(const PendingMove& from, const std::string& to,
   // (moved out of an ignored name, into another folder, ...).
   std::vector<int> empty;
   bool newly_covered = dir_by_path_.count(to) == 0;
-  for (auto& [wd, dir] : dirs_) {
-    if (!IsUnder(dir.path, to)) continue;
+  for (int wd : WatchesUnder(to)) {
+    Dir& dir = dirs_[wd];
     std::set<int> cover;
     std::set<int> candidates = all;
     candidates.insert(dir.roots.begin(), dir.roots.end());

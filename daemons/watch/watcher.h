@@ -12,6 +12,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -39,6 +40,11 @@ struct WatcherOptions {
   // Events handled per step at most, so that queues are appended to and the
   // step returns regularly even under a storm.
   size_t max_events_per_step = 16384;
+  // Tests only: when set and it returns an errno value for a directory, the
+  // watch of that directory fails with it as if the kernel had refused
+  // (ENOSPC: the watch limit), since the real limit is one for the whole
+  // machine.
+  std::function<int(const std::string& dir)> watch_fault;
 };
 
 class Watcher {
@@ -107,6 +113,8 @@ class Watcher {
   void WatchTree(const std::set<int>& roots, const std::string& top, bool emit_creates);
   int WatchOne(const std::set<int>& roots, const std::string& dir);
   void DropRootFromTree(int id, const std::string& top);
+  // Watch descriptors of the directories at or below top, by path.
+  std::vector<int> WatchesUnder(const std::string& top) const;
   void UnwatchTree(const std::string& top);
   void Retarget(const std::string& from, const std::string& to);
   void EraseDir(int wd);

@@ -1,0 +1,214 @@
+// kalonotifyd: the file-change watcher. It follows the monitor registrations
+// under /var/lib/orvex/monitor/<app>/ and appends one line per change in the
+// registered folders to each registration's queue, under the queue's lock.
+//
+//   kalonotifyd [--foreground] [--status-interval SECONDS]
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/signalfd.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <iostream>
+#include <stdexcept>
+#include <string>
+
+#include "kalo/kalo_notify.h"
+#include "orvex/foundation/json.h"
+#include "orvex/foundation/util.h"
+#include "orvex/portable/atomic_file.h"
+#include "orvex/portable/file_descriptor.h"
+#include "orvex/portable/root.h"
+#include "orvex/version.h"
+#include "watch/watcher.h"
+
+namespace {
+
+using orvex::portable::RootPath;
+
+constexpr char kIdent[] = "kalonotifyd";
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = 2;
+constexpr int kStepMs = 1000;
+constexpr int kFinalRounds = 64;
+
+constexpr char kUsage[] =
+    "usage: kalonotifyd [--foreground] [--status-interval SECONDS]\n"
+    "The file-change watcher: follows the monitor queue registrations under\n"
+    "/var/lib/orvex/monitor/<app>/ (under ORVEX_ROOT when set), watches every\n"
+    "registered folder with inotify and appends one JSON line per change to its\n"
+    "queue (see doc/queue_line.md and doc/monitor_registry.md).\n"
+    "  --foreground               stay in the foreground (otherwise it detaches\n"
+    "                             once the registrations are watched and writes\n"
+    "                             its pid to /var/run/kalonotifyd.pid)\n"
+    "  --status-interval SECONDS  how often /var/run/kalonotifyd.status.json is\n"
+    "                             rewritten (default 5); `orvex watch status` shows it\n"
+    "  --help, --version\n"
+    "Exit status: 0 after SIGTERM or SIGINT (every change read by then is written),\n"
+    "1 when it cannot start, 2 on bad usage. If the log says the watch limit or the\n"
+    "event queue was exceeded, raise fs.inotify.max_user_watches or\n"
+    "fs.inotify.max_queued_events with sysctl.\n";
+
+class UsageError : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+struct Options {
+  bool help = false;
+  bool version = false;
+  bool foreground = false;
+  int status_interval_s = 5;
+};
+
+Options ParseArgs(int argc, char** argv) {
+  Options opt;
+  for (int i = 1; i < argc; ++i) {
+    const std::string arg = argv[i];
+    if (arg == "--help") {
+      opt.help = true;
+    } else if (arg == "--version") {
+      opt.version = true;
+    } else if (arg == "--foreground") {
+      opt.foreground = true;
+    } else if (arg == "--status-interval") {
+      if (i + 1 >= argc) throw UsageError(arg + " needs a value");
+      const std::string text = argv[++i];
+      char* end = nullptr;
+      const long value = std::strtol(text.c_str(), &end, 10);
+      if (text.empty() || *end != '\0' || value < 1 || value > 3600) {
+        throw UsageError(arg + " takes a number from 1 to 3600, not \"" + text + "\"");
+      }
+      opt.status_interval_s = static_cast<int>(value);
+    } else {
+      throw UsageError("unknown argument " + arg);
+    }
+  }
+  return opt;
+}
+
+// SIGTERM and SIGINT arrive through a descriptor the step waits on, so a stop
+// is seen at once and never between a check and a wait.
+orvex::FileDescriptor StopSignals() {
+  sigset_t stop;
+  sigemptyset(&stop);
+  sigaddset(&stop, SIGTERM);
+  sigaddset(&stop, SIGINT);
+  ::sigprocmask(SIG_BLOCK, &stop, nullptr);
+  ::signal(SIGPIPE, SIG_IGN);
+  return orvex::FileDescriptor(::signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+// Detaches: the parent returns once the child says it watches (one byte on
+// the pipe) or has failed (the pipe closes empty), so that whoever started
+// the daemon may change files as soon as the command returns.
+int Detach(orvex::FileDescriptor& ready) {
+  int fds[2];
+  if (::pipe2(fds, O_CLOEXEC) != 0) return kExitFailure;
+  orvex::FileDescriptor read_end(fds[0]);
+  ready.reset(fds[1]);
+  const pid_t pid = ::fork();
+  if (pid < 0) return kExitFailure;
+  if (pid > 0) {
+    ready.reset();
+    char byte = 0;
+    ssize_t n;
+    while ((n = ::read(read_end.get(), &byte, 1)) < 0 && errno == EINTR) {
+    }
+    return n == 1 ? 0 : kExitFailure;
+  }
+  ::setsid();
+  if (::chdir("/") != 0) return kExitFailure;
+  const orvex::FileDescriptor null(::open("/dev/null", O_RDWR | O_CLOEXEC));
+  for (int fd = 0; fd <= 2; ++fd) ::dup2(null.get(), fd);
+  return -1;  // in the daemon: go on
+}
+
+void WriteStatus(const orvex::watch::Watcher& watcher, bool running) {
+  Json::Value status = watcher.Status();
+  status["pid"] = static_cast<Json::Int>(::getpid());
+  status["version"] = ORVEX_VERSION;
+  status["running"] = running;
+  status["updated"] = static_cast<Json::Int64>(std::time(nullptr));
+  const std::string path = RootPath(KALO::KALONOTIFYD::kNotifyStatusPath);
+  // A private root starts without /var/run.
+  orvex::MakeParentDirectories(path);
+  if (!orvex::portable::WriteFileAtomic(path, orvex::toString(status) + "\n")) {
+    syslog(LOG_WARNING, "cannot write %s: %s", path.c_str(), std::strerror(errno));
+  }
+}
+
+int Serve(const Options& opt) {
+  orvex::FileDescriptor ready;
+  if (!opt.foreground) {
+    const int status = Detach(ready);
+    if (status >= 0) return status;
+  }
+  ::openlog(kIdent, LOG_PID, LOG_DAEMON);
+  orvex::FileDescriptor stop = StopSignals();
+  orvex::watch::WatcherOptions options;
+  options.registry_dir = RootPath(KALO::KALONOTIFYD::kMonitorRegistryDir);
+  orvex::watch::Watcher watcher(options);
+  std::string why;
+  if (!stop || !watcher.Start(why)) {
+    if (!stop) why = std::string("signalfd failed: ") + std::strerror(errno);
+    syslog(LOG_ERR, "%s", why.c_str());
+    std::cerr << kIdent << ": " << why << "\n";
+    return kExitFailure;
+  }
+  watcher.set_wake_fd(stop.get());
+  const std::string pid_path = RootPath(KALO::KALONOTIFYD::kNotifyPidPath);
+  if (!opt.foreground) {
+    orvex::MakeParentDirectories(pid_path);
+    orvex::portable::WriteFileAtomic(pid_path, std::to_string(::getpid()) + "\n");
+    if (::write(ready.get(), "r", 1) != 1) return kExitFailure;
+    ready.reset();
+  }
+  syslog(LOG_INFO, "watching %zu directories for %s", watcher.watch_count(),
+         options.registry_dir.c_str());
+  WriteStatus(watcher, /*running=*/true);
+  const auto interval = std::chrono::seconds(opt.status_interval_s);
+  auto next_status = std::chrono::steady_clock::now() + interval;
+  while (!watcher.woken()) {
+    watcher.RunOnce(kStepMs);
+    if (std::chrono::steady_clock::now() >= next_status) {
+      WriteStatus(watcher, /*running=*/true);
+      next_status = std::chrono::steady_clock::now() + interval;
+    }
+  }
+  // The stop may have come with changes still queued in the kernel: they are
+  // read and written before the daemon goes, within a bound so that a storm
+  // cannot hold the stop off for ever (each step writes all that it read).
+  for (int round = 0; round < kFinalRounds && watcher.RunOnce(0) > 0; ++round) {
+  }
+  WriteStatus(watcher, /*running=*/false);
+  if (!opt.foreground) ::unlink(pid_path.c_str());
+  syslog(LOG_INFO, "stopped");
+  return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options opt;
+  try {
+    opt = ParseArgs(argc, argv);
+  } catch (const UsageError& e) {
+    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
+    return kExitUsage;
+  }
+  if (opt.help) {
+    std::cout << kUsage;
+    return 0;
+  }
+  if (opt.version) {
+    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
+    return 0;
+  }
+  return Serve(opt);
+}

@@ -1,0 +1,199 @@
+// Monitor queue registrations: one file per queue under the application's
+// directory, replaced whole, removed on Delete, and refused (with nothing
+// written) when the type, the application name or the description is wrong.
+#include "kalo/kalo_notify.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "kalo_test_root.h"
+#include "support/run_program.h"
+
+namespace KALO {
+namespace KALONOTIFYD {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr unsigned kMask = 65478;
+
+Json::Value Description(const std::string& queue, const std::vector<std::string>& folders) {
+  Json::Value desc(Json::objectValue);
+  desc["queue"] = queue;
+  desc["config"] = Json::Value(Json::arrayValue);
+  for (const std::string& folder : folders) {
+    Json::Value entry(Json::objectValue);
+    entry["path"] = folder;
+    entry["mask"] = kMask;
+    entry["ignore"] = Json::Value(Json::arrayValue);
+    entry["ignore"].append("@eaDir");
+    desc["config"].append(entry);
+  }
+  return desc;
+}
+
+Json::Value ReadJson(const std::string& path) {
+  Json::Value value;
+  Json::CharReaderBuilder builder;
+  std::string errors;
+  std::istringstream in(orvex::testing::ReadFileText(path));
+  EXPECT_TRUE(Json::parseFromStream(builder, in, &value, &errors)) << path << ": " << errors;
+  return value;
+}
+
+std::vector<std::string> FilesIn(const std::string& dir) {
+  std::vector<std::string> names;
+  if (!fs::exists(dir)) return names;
+  for (const auto& e : fs::directory_iterator(dir)) names.push_back(e.path().filename());
+  return names;
+}
+
+class MonitorQueueTest : public orvex::testing::TempRootTest {
+ protected:
+  std::string AppDir() const { return root_ + "/var/lib/orvex/monitor/fileindex"; }
+};
+
+TEST_F(MonitorQueueTest, UpsertWritesOneFileWithTheDescription) {
+  const std::string queue = "/volume1/photo/@eaDir/@fileindex/queue";
+  ASSERT_TRUE(MonitorQueue::Upsert(
+      MonitorQueue(Description(queue, {"/volume1/photo/a", "/volume1/photo/b"})), "fileindex",
+      MONITOR_QUEUE_TYPE_APPLICATION));
+  const std::string file = MonitorRegistrationPath(queue, "fileindex");
+  EXPECT_EQ(AppDir() + "/%2Fvolume1%2Fphoto%2F@eaDir%2F@fileindex%2Fqueue.json", file);
+  EXPECT_EQ(std::vector<std::string>{fs::path(file).filename()}, FilesIn(AppDir()));
+  const Json::Value stored = ReadJson(file);
+  EXPECT_EQ(queue, stored["queue"].asString());
+  ASSERT_EQ(2u, stored["config"].size());
+  EXPECT_EQ("/volume1/photo/a", stored["config"][0]["path"].asString());
+  EXPECT_EQ("/volume1/photo/b", stored["config"][1]["path"].asString());
+  EXPECT_EQ(kMask, stored["config"][1]["mask"].asUInt());
+  EXPECT_EQ("@eaDir", stored["config"][0]["ignore"][0].asString());
+  struct stat st;
+  ASSERT_EQ(0, ::stat(file.c_str(), &st));
+  EXPECT_EQ(0644u, st.st_mode & 07777);
+}
+
+TEST_F(MonitorQueueTest, UpsertReplacesTheFolderList) {
+  const std::string queue = "/v/s/@eaDir/@fileindex/queue";
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s/a", "/v/s/b"})),
+                                   "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s/c"})), "fileindex",
+                                   MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_EQ(1u, FilesIn(AppDir()).size());
+  const Json::Value stored = ReadJson(MonitorRegistrationPath(queue, "fileindex"));
+  ASSERT_EQ(1u, stored["config"].size());
+  EXPECT_EQ("/v/s/c", stored["config"][0]["path"].asString());
+}
+
+TEST_F(MonitorQueueTest, MissingIgnoreIsStoredEmpty) {
+  Json::Value desc = Description("/v/s/q", {"/v/s"});
+  desc["config"][0].removeMember("ignore");
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(desc), "app", MONITOR_QUEUE_TYPE_APPLICATION));
+  const Json::Value stored = ReadJson(MonitorRegistrationPath("/v/s/q", "app"));
+  EXPECT_TRUE(stored["config"][0]["ignore"].isArray());
+  EXPECT_EQ(0u, stored["config"][0]["ignore"].size());
+}
+
+TEST_F(MonitorQueueTest, DeleteRemovesAndAnAbsentQueueCountsAsRemoved) {
+  const std::string queue = "/v/s/@eaDir/@fileindex/queue";
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s"})), "fileindex",
+                                   MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_TRUE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_TRUE(FilesIn(AppDir()).empty());
+  EXPECT_TRUE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_TRUE(MonitorQueue::Delete("/never/registered", "other", MONITOR_QUEUE_TYPE_APPLICATION));
+}
+
+TEST_F(MonitorQueueTest, RefusesBadInputWithoutWriting) {
+  const Json::Value good = Description("/v/s/q", {"/v/s"});
+  struct Case {
+    const char* what;
+    Json::Value desc;
+    std::string app;
+    int type;
+  };
+  std::vector<Case> cases = {
+      {"unknown type", good, "fileindex", 7},
+      {"empty app", good, "", MONITOR_QUEUE_TYPE_APPLICATION},
+      {"app with slash", good, "a/b", MONITOR_QUEUE_TYPE_APPLICATION},
+      {"app ..", good, "..", MONITOR_QUEUE_TYPE_APPLICATION},
+      {"app too long", good, std::string(65, 'a'), MONITOR_QUEUE_TYPE_APPLICATION},
+  };
+  auto bad = [&](const char* what, auto change) {
+    Json::Value desc = good;
+    change(desc);
+    cases.push_back({what, desc, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION});
+  };
+  bad("not an object", [](Json::Value& d) { d = Json::Value(Json::arrayValue); });
+  bad("relative queue", [](Json::Value& d) { d["queue"] = "v/s/q"; });
+  bad("no queue", [](Json::Value& d) { d.removeMember("queue"); });
+  bad("config not array", [](Json::Value& d) { d["config"] = 1; });
+  bad("entry not object", [](Json::Value& d) { d["config"][0] = "x"; });
+  bad("relative folder", [](Json::Value& d) { d["config"][0]["path"] = "s"; });
+  bad("mask string", [](Json::Value& d) { d["config"][0]["mask"] = "65478"; });
+  bad("mask negative", [](Json::Value& d) { d["config"][0]["mask"] = -1; });
+  bad("mask too big", [](Json::Value& d) { d["config"][0]["mask"] = Json::Int64(1) << 32; });
+  bad("ignore not array", [](Json::Value& d) { d["config"][0]["ignore"] = "@eaDir"; });
+  bad("ignore with slash", [](Json::Value& d) { d["config"][0]["ignore"][0] = "a/b"; });
+  bad("ignore empty name", [](Json::Value& d) { d["config"][0]["ignore"][0] = ""; });
+  for (const Case& c : cases) {
+    errno = 0;
+    EXPECT_FALSE(
+        MonitorQueue::Upsert(MonitorQueue(c.desc), c.app, static_cast<MONITOR_QUEUE_TYPE>(c.type)))
+        << c.what;
+    EXPECT_EQ(EINVAL, errno) << c.what;
+  }
+  EXPECT_FALSE(fs::exists(root_ + "/var/lib/orvex/monitor/fileindex"));
+  errno = 0;
+  EXPECT_FALSE(MonitorQueue::Delete("relative", "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_EQ(EINVAL, errno);
+}
+
+TEST_F(MonitorQueueTest, FileNamesAreDistinctAndShort) {
+  const std::string long_a = "/v/" + std::string(300, 'x') + "/a/queue";
+  const std::string long_b = "/v/" + std::string(300, 'x') + "/b/queue";
+  const std::vector<std::string> queues = {"/v/s/queue",   "/v/s%2Fqueue", "/v/s/que ue",
+                                           "/v/s/qu\neue", long_a,         long_b};
+  std::set<std::string> names;
+  for (const std::string& q : queues) {
+    const std::string path = MonitorRegistrationPath(q, "fileindex");
+    const std::string name = fs::path(path).filename();
+    EXPECT_LE(name.size(), 255u) << q;
+    EXPECT_EQ(std::string::npos, name.find('/')) << q;
+    EXPECT_NE('.', name[0]) << q;
+    names.insert(name);
+  }
+  EXPECT_EQ(queues.size(), names.size());
+  for (const std::string& q : queues) {
+    ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(q, {"/v/s"})), "fileindex",
+                                     MONITOR_QUEUE_TYPE_APPLICATION))
+        << q;
+    EXPECT_EQ(q, ReadJson(MonitorRegistrationPath(q, "fileindex"))["queue"].asString());
+  }
+  EXPECT_EQ(queues.size(), FilesIn(AppDir()).size());
+  EXPECT_EQ("", MonitorRegistrationPath("/v/s/q", "../x"));
+}
+
+TEST_F(MonitorQueueTest, AFileOfAnotherQueueIsNotReplaced) {
+  const std::string queue = "/v/s/q";
+  const std::string file = MonitorRegistrationPath(queue, "fileindex");
+  fs::create_directories(AppDir());
+  // As if another queue's long path had hashed to the same name.
+  dir_.Write(fs::relative(file, root_), "{\"queue\": \"/v/other\", \"config\": []}");
+  errno = 0;
+  EXPECT_FALSE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s"})), "fileindex",
+                                    MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_EQ(EEXIST, errno);
+  EXPECT_FALSE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_EQ("/v/other", ReadJson(file)["queue"].asString());
+}
+
+}  // namespace
+}  // namespace KALONOTIFYD
+}  // namespace KALO

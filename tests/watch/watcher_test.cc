@@ -1,0 +1,380 @@
+// The watcher driven step by step (RunOnce) on a temporary tree: the lines it
+// appends for each kind of change, registrations followed while it runs, new
+// directories, ignored names, masks, a kernel queue overflow, and folders that
+// go away and come back. Every test reads the queue file as the indexing
+// daemon would.
+#include "watch/watcher.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include "kalo/kalo_notify.h"
+#include "orvex/portable/root.h"
+#include "orvex/queue/event.h"
+#include "support/log_capture.h"
+#include "support/run_program.h"
+#include "support/temp_dir.h"
+
+namespace orvex {
+namespace watch {
+namespace {
+
+namespace fs = std::filesystem;
+using KALO::KALONOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION;
+using KALO::KALONOTIFYD::MonitorQueue;
+
+constexpr unsigned kAllKinds = 65478;  // what the library registers
+
+// The line the watcher must write, spelt out independently of its writer.
+std::string Line(unsigned event, bool is_dir, const std::string& path,
+                 const std::string& path_old = "") {
+  std::string line = "{\"event\":" + std::to_string(event) +
+                     ",\"is_dir\":" + (is_dir ? "true" : "false") + ",\"path\":\"" + path + "\"";
+  if (!path_old.empty()) line += ",\"path_old\":\"" + path_old + "\"";
+  return line + "}";
+}
+
+class WatcherTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    fs::create_directories(share_);
+    WatcherOptions options;
+    options.registry_dir = portable::RootPath(KALO::KALONOTIFYD::kMonitorRegistryDir);
+    options.missing_retry = std::chrono::milliseconds(0);
+    options.watch_fault = [this](const std::string& dir) {
+      return dir.size() >= 5 && dir.compare(dir.size() - 5, 5, "/full") == 0 ? watch_fault_ : 0;
+    };
+    watcher_ = std::make_unique<Watcher>(options);
+    std::string why;
+    ASSERT_TRUE(watcher_->Start(why)) << why;
+  }
+
+  void Register(const std::vector<std::string>& folders, unsigned mask = kAllKinds,
+                const std::vector<std::string>& ignore = {"@eaDir"},
+                const std::string& queue = "") {
+    Json::Value desc(Json::objectValue);
+    desc["queue"] = queue.empty() ? queue_ : queue;
+    desc["config"] = Json::Value(Json::arrayValue);
+    for (const std::string& folder : folders) {
+      Json::Value entry(Json::objectValue);
+      entry["path"] = folder;
+      entry["mask"] = mask;
+      entry["ignore"] = Json::Value(Json::arrayValue);
+      for (const std::string& name : ignore) entry["ignore"].append(name);
+      desc["config"].append(entry);
+    }
+    ASSERT_TRUE(
+        MonitorQueue::Upsert(MonitorQueue(desc), "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  }
+
+  // Steps until a step finds nothing more to do.
+  void Drain() {
+    for (int i = 0; i < 1000 && watcher_->RunOnce(0) > 0; ++i) {
+    }
+  }
+
+  std::vector<std::string> Lines(const std::string& queue = "") const {
+    return testing::SplitLines(testing::ReadFileText(queue.empty() ? queue_ : queue));
+  }
+
+  // Lines written since the last call.
+  std::vector<std::string> NewLines() {
+    Drain();
+    std::vector<std::string> all = Lines();
+    std::vector<std::string> fresh(all.begin() + static_cast<long>(seen_), all.end());
+    seen_ = all.size();
+    return fresh;
+  }
+
+  static void WriteFile(const std::string& path, const std::string& content = "x") {
+    std::ofstream(path, std::ios::binary) << content;
+  }
+
+  testing::TempDir dir_;
+  testing::ScopedOrvexRoot orvex_root_{dir_.path()};
+  const std::string share_ = dir_.Join("volume1/photo");
+  std::string queue_ = share_ + "/@eaDir/@fileindex/queue";
+  std::unique_ptr<Watcher> watcher_;
+  size_t seen_ = 0;
+  int watch_fault_ = 0;  // errno for watches of directories named "full"
+};
+
+TEST_F(WatcherTest, RegistrationAddedWhileRunningIsWatchedAtOnce) {
+  WriteFile(share_ + "/before");
+  Drain();
+  EXPECT_FALSE(fs::exists(queue_));
+  Register({share_});
+  Drain();
+  WriteFile(share_ + "/a");
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(64, false, share_ + "/a"), Line(2, false, share_ + "/a")}),
+      NewLines());
+}
+
+TEST_F(WatcherTest, RegistrationRemovedWhileRunningStopsTheLines) {
+  Register({share_});
+  Drain();
+  ASSERT_TRUE(MonitorQueue::Delete(queue_, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  Drain();
+  WriteFile(share_ + "/a");
+  EXPECT_TRUE(NewLines().empty());
+  EXPECT_EQ(0u, watcher_->watch_count());
+}
+
+TEST_F(WatcherTest, RegistrationChangedFollowsTheNewFolderList) {
+  fs::create_directories(share_ + "/a");
+  fs::create_directories(share_ + "/b");
+  Register({share_ + "/a"});
+  Drain();
+  Register({share_ + "/b"});
+  Drain();
+  WriteFile(share_ + "/a/x");
+  WriteFile(share_ + "/b/y");
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(64, false, share_ + "/b/y"), Line(2, false, share_ + "/b/y")}),
+      NewLines());
+}
+
+TEST_F(WatcherTest, EachKindOfChangeHasItsLine) {
+  Register({share_});
+  Drain();
+  const std::string f = share_ + "/f.txt";
+  const std::string d = share_ + "/d";
+  WriteFile(f);
+  ASSERT_EQ(0, ::chmod(f.c_str(), 0600));
+  ASSERT_EQ(0, ::unlink(f.c_str()));
+  ASSERT_EQ(0, ::mkdir(d.c_str(), 0755));
+  ASSERT_EQ(0, ::chmod(d.c_str(), 0700));
+  ASSERT_EQ(0, ::rmdir(d.c_str()));
+  EXPECT_EQ((std::vector<std::string>{Line(64, false, f), Line(2, false, f), Line(4, false, f),
+                                      Line(128, false, f), Line(64, true, d), Line(4, true, d),
+                                      Line(128, true, d)}),
+            NewLines());
+}
+
+TEST_F(WatcherTest, RenamesArePairedAndLoneHalvesBecomeDeleteOrCreate) {
+  const std::string outside = dir_.Join("outside");
+  fs::create_directories(outside);
+  fs::create_directories(share_ + "/d/sub");
+  WriteFile(share_ + "/a");
+  WriteFile(outside + "/in");
+  Register({share_});
+  Drain();
+  fs::rename(share_ + "/a", share_ + "/b");
+  fs::rename(share_ + "/d", share_ + "/e");
+  fs::rename(share_ + "/b", outside + "/b");
+  fs::rename(outside + "/in", share_ + "/in");
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(256, false, share_ + "/b", share_ + "/a"),
+                                Line(256, true, share_ + "/e", share_ + "/d"),
+                                Line(128, false, share_ + "/b"), Line(64, false, share_ + "/in")}),
+      NewLines());
+  // The renamed directory's watches follow it.
+  WriteFile(share_ + "/e/sub/z");
+  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/e/sub/z"),
+                                      Line(2, false, share_ + "/e/sub/z")}),
+            NewLines());
+}
+
+TEST_F(WatcherTest, DirectoryMovedOutIsNoLongerWatchedAndMovedInIs) {
+  const std::string outside = dir_.Join("outside");
+  fs::create_directories(outside + "/in/deep");
+  fs::create_directories(share_ + "/out");
+  Register({share_});
+  Drain();
+  fs::rename(share_ + "/out", outside + "/out");
+  fs::rename(outside + "/in", share_ + "/in");
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(128, true, share_ + "/out"), Line(64, true, share_ + "/in")}),
+      NewLines());
+  WriteFile(outside + "/out/gone");
+  WriteFile(share_ + "/in/deep/here");
+  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/in/deep/here"),
+                                      Line(2, false, share_ + "/in/deep/here")}),
+            NewLines());
+}
+
+TEST_F(WatcherTest, EveryFileOfANewDirectoryReachesTheQueue) {
+  Register({share_});
+  Drain();
+  std::set<std::string> made;
+  // Files and directories made right after mkdir, before the watcher has
+  // had a chance to watch the new directory.
+  for (int i = 0; i < 5; ++i) {
+    const std::string d = share_ + "/new" + std::to_string(i);
+    ASSERT_EQ(0, ::mkdir(d.c_str(), 0755));
+    ASSERT_EQ(0, ::mkdir((d + "/inner").c_str(), 0755));
+    made.insert(d);
+    made.insert(d + "/inner");
+    for (int j = 0; j < 40; ++j) {
+      const std::string f = d + (j % 2 ? "/inner" : "") + "/f" + std::to_string(j);
+      WriteFile(f);
+      made.insert(f);
+    }
+  }
+  std::set<std::string> created;
+  for (const std::string& line : NewLines()) {
+    fileindex::Event ev(line);
+    if (ev.event == fileindex::EVENT_CREATE) created.insert(ev.path);
+  }
+  EXPECT_EQ(made, created);
+  // And the new directories are watched from now on.
+  WriteFile(share_ + "/new3/inner/late");
+  EXPECT_EQ(Line(64, false, share_ + "/new3/inner/late"), NewLines().at(0));
+}
+
+TEST_F(WatcherTest, IgnoredNamesMetadataAndQueueFilesAreSkipped) {
+  const std::string queue = share_ + "/q/queue";  // a queue inside its own folder
+  queue_ = queue;
+  fs::create_directories(share_ + "/skip/deeper");
+  fs::create_directories(share_ + "/q");
+  Register({share_}, kAllKinds, {"skip", "@eaDir"}, queue);
+  Drain();
+  WriteFile(share_ + "/skip/a");
+  WriteFile(share_ + "/skip/deeper/b");
+  fs::create_directories(share_ + "/@eaDir/x");
+  WriteFile(share_ + "/@eaDir/x/c");
+  fs::create_directories(share_ + "/sub/skip");
+  WriteFile(share_ + "/sub/skip/d");
+  WriteFile(share_ + "/kept");
+  // The watcher's own appends to the queue must not feed back into it.
+  for (int round = 0; round < 3; ++round) Drain();
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(64, true, share_ + "/sub"), Line(64, false, share_ + "/kept"),
+                                Line(2, false, share_ + "/kept")}),
+      NewLines());
+}
+
+TEST_F(WatcherTest, OnlyKindsInTheMaskAreWritten) {
+  Register({share_}, fileindex::EVENT_CREATE | fileindex::EVENT_DELETE);
+  Drain();
+  const std::string f = share_ + "/f";
+  WriteFile(f);
+  ASSERT_EQ(0, ::chmod(f.c_str(), 0600));
+  fs::rename(f, share_ + "/g");
+  ASSERT_EQ(0, ::unlink((share_ + "/g").c_str()));
+  // No rename bit: the rename is told as the two changes it makes.
+  EXPECT_EQ(
+      (std::vector<std::string>{Line(64, false, f), Line(128, false, f),
+                                Line(64, false, share_ + "/g"), Line(128, false, share_ + "/g")}),
+      NewLines());
+}
+
+TEST_F(WatcherTest, NestedFoldersOfOneQueueTellEachChangeOnce) {
+  fs::create_directories(share_ + "/a/b");
+  Register({share_ + "/a", share_ + "/a/b"});
+  Drain();
+  WriteFile(share_ + "/a/b/f");
+  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/a/b/f"),
+                                      Line(2, false, share_ + "/a/b/f")}),
+            NewLines());
+}
+
+TEST_F(WatcherTest, NamesWithAnyBytesStayOneValidLine) {
+  Register({share_});
+  Drain();
+  const std::string name = "new\nline \"quoted\" \\ tab\t \xff\xfe end";
+  WriteFile(share_ + "/" + name);
+  const std::vector<std::string> lines = NewLines();
+  ASSERT_EQ(2u, lines.size());
+  for (const std::string& line : lines) {
+    fileindex::Event ev(line);
+    EXPECT_EQ(share_ + "/" + name, ev.path);
+  }
+}
+
+TEST_F(WatcherTest, KernelQueueOverflowWritesTheCrashMark) {
+  Register({share_});
+  Drain();
+  long limit = 16384;
+  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
+  const std::string a = share_ + "/a";
+  const std::string b = share_ + "/b";
+  WriteFile(a);
+  WriteFile(b);
+  testing::LogCapture log;
+  // Alternating files: the kernel merges a repeat of the last event only.
+  for (long i = 0; i < limit + 100; ++i) {
+    ASSERT_EQ(0, ::chmod(i % 2 ? a.c_str() : b.c_str(), i % 4 < 2 ? 0600 : 0644));
+  }
+  const std::vector<std::string> lines = NewLines();
+  EXPECT_EQ(1, std::count(lines.begin(), lines.end(), Line(512, false, share_)));
+  EXPECT_EQ(1u, log.Matching("fs.inotify.max_queued_events").size());
+  // Still watching afterwards.
+  WriteFile(share_ + "/after");
+  EXPECT_EQ(Line(64, false, share_ + "/after"), NewLines().at(0));
+}
+
+TEST_F(WatcherTest, WatchLimitWritesTheCrashMarkAndSaysWhichSysctl) {
+  Register({share_});
+  Drain();
+  watch_fault_ = ENOSPC;
+  testing::LogCapture log;
+  fs::create_directories(share_ + "/a/full");
+  fs::create_directories(share_ + "/b/full");
+  const std::vector<std::string> lines = NewLines();
+  EXPECT_EQ(1, std::count(lines.begin(), lines.end(), Line(512, false, share_)));
+  EXPECT_LE(1, std::count(lines.begin(), lines.end(), Line(64, true, share_ + "/a/full")));
+  EXPECT_EQ(1u, log.Matching("fs.inotify.max_user_watches").size());
+  EXPECT_LE(2u, watcher_->Status()["watch_limit_hits"].asUInt());
+  // Changes elsewhere go on being told.
+  WriteFile(share_ + "/a/ok");
+  EXPECT_EQ(Line(64, false, share_ + "/a/ok"), NewLines().at(0));
+}
+
+TEST_F(WatcherTest, FolderThatGoesAwayIsWatchedAgainWhenItReturns) {
+  const std::string folder = share_ + "/docs";
+  fs::create_directories(folder + "/sub");
+  Register({folder});
+  Drain();
+  testing::LogCapture log;
+  fs::remove_all(folder);
+  EXPECT_EQ((std::vector<std::string>{Line(128, true, folder + "/sub"), Line(128, true, folder)}),
+            NewLines());
+  EXPECT_EQ(1u, log.Matching(folder + " of queue").size());
+  fs::create_directories(folder);
+  EXPECT_EQ(std::vector<std::string>{Line(64, true, folder)}, NewLines());
+  WriteFile(folder + "/back");
+  EXPECT_EQ((std::vector<std::string>{Line(64, false, folder + "/back"),
+                                      Line(2, false, folder + "/back")}),
+            NewLines());
+}
+
+TEST_F(WatcherTest, FolderMissingAtRegistrationIsWatchedOnceItExists) {
+  const std::string folder = share_ + "/later";
+  Register({folder});
+  Drain();
+  EXPECT_EQ(0u, watcher_->watch_count());
+  fs::create_directories(folder);
+  EXPECT_EQ(std::vector<std::string>{Line(64, true, folder)}, NewLines());
+  WriteFile(folder + "/f");
+  EXPECT_EQ(Line(64, false, folder + "/f"), NewLines().at(0));
+}
+
+TEST_F(WatcherTest, StatusTellsFoldersWatchesAndLines) {
+  fs::create_directories(share_ + "/a/b");
+  Register({share_});
+  Drain();
+  WriteFile(share_ + "/f");
+  Drain();
+  const Json::Value status = watcher_->Status();
+  EXPECT_EQ(3u, status["watches"].asUInt());  // share, a, a/b
+  ASSERT_EQ(1u, status["folders"].size());
+  EXPECT_EQ(share_, status["folders"][0]["path"].asString());
+  EXPECT_TRUE(status["folders"][0]["watched"].asBool());
+  ASSERT_EQ(1u, status["queues"].size());
+  EXPECT_EQ(queue_, status["queues"][0]["queue"].asString());
+  EXPECT_EQ(2u, status["queues"][0]["lines_written"].asUInt());
+}
+
+}  // namespace
+}  // namespace watch
+}  // namespace orvex
