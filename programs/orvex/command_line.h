@@ -62,6 +62,24 @@ int RunResumeCommand(const Args& args);  // status_commands.cc
 int RunFolderCommand(const Args& args);  // folder_commands.cc
 
 int RunExtractCommand(const Args& args);  // extract_commands.cc
+int RunWatchCommand(const Args& args);    // watch_commands.cc
+int RunSearchCommand(const Args& args);   // search_commands.cc
+int RunStatsCommand(const Args& args);    // search_commands.cc
+
+// The management commands (manage_commands.cc): two groups of their own and
+// the changing subcommands of the folder and share groups.
+int RunVolumeCommand(const Args& args);
+int RunServicesCommand(const Args& args);
+int FolderAddCommand(const Args& args);
+int FolderSetCommand(const Args& args);
+int FolderReindexCommand(const Args& args);
+int FolderDeleteCommand(const Args& args);
+int SharePauseCommand(const Args& args);
+int ShareResumeCommand(const Args& args);
+int ShareForgetCommand(const Args& args);
+int ShareRenameCommand(const Args& args);
+int ShareMigrateCommand(const Args& args);
+int ShareCheckRecycleCommand(const Args& args);
 
 // Arguments split into options ("--name") and positional words. "--" ends
 // the options; a word such as "-2" is positional, so that numbers may be

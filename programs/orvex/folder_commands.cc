@@ -28,7 +28,11 @@ constexpr char kFolderUsage[] =
     "usage: orvex folder list [--offset N] [--limit N] [--sort-by KEY] [--desc] [--status]\n"
     "                         [--json]\n"
     "       orvex folder get PATH [--json]\n"
-    "Shows the indexed folders. Run `orvex folder SUBCOMMAND --help` for details.\n";
+    "       orvex folder add PATH [NAME] [--no-TYPE...] [--updater]\n"
+    "       orvex folder set PATH [NAME] [--no-TYPE...] [--updater]\n"
+    "       orvex folder reindex PATH...\n"
+    "       orvex folder delete PATH...\n"
+    "Shows and changes the indexed folders. Run `orvex folder SUBCOMMAND --help` for details.\n";
 
 constexpr char kListUsage[] =
     "usage: orvex folder list [--offset N] [--limit N] [--sort-by KEY] [--desc] [--status]\n"
@@ -242,6 +246,10 @@ int RunFolderCommand(const Args& args) {
   static const std::vector<Subcommand> kSubcommands = {
       {"list", List},
       {"get", Get},
+      {"add", FolderAddCommand},
+      {"set", FolderSetCommand},
+      {"reindex", FolderReindexCommand},
+      {"delete", FolderDeleteCommand},
   };
   return RunSubcommand(args, "folder", kSubcommands, kFolderUsage);
 }

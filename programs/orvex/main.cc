@@ -24,12 +24,17 @@ namespace {
 //   3. add one line {"folder", "<one-line summary>", RunFolderCommand} below.
 // The build picks the new file up by itself.
 const CommandGroup kCommands[] = {
-    {"share", "add, list and remove shares in the share registry", RunShareCommand},
+    {"share", "manage the share registry and pause, resume or forget shares", RunShareCommand},
     {"status", "show whether indexing is paused and each share's status", RunStatusCommand},
     {"pause", "pause indexing for HOURS hours, or with no end", RunPauseCommand},
     {"resume", "resume indexing", RunResumeCommand},
-    {"folder", "list the indexed folders or show one", RunFolderCommand},
+    {"folder", "list, show, add, change, re-index or delete indexed folders", RunFolderCommand},
     {"extract", "show what content extraction gives for files", RunExtractCommand},
+    {"watch", "show what the file-change watcher reports", RunWatchCommand},
+    {"search", "search the indexed shares by name, text, type or folder", RunSearchCommand},
+    {"stats", "show the search indexes: documents, size, paused", RunStatsCommand},
+    {"volume", "pause, resume or forget the indexed shares of a volume", RunVolumeCommand},
+    {"services", "start or stop the services indexing needs", RunServicesCommand},
 };
 
 std::string Usage() {

@@ -31,7 +31,12 @@ constexpr char kShareUsage[] =
     "                       [--hide-unreadable]\n"
     "       orvex share list [--json]\n"
     "       orvex share remove NAME\n"
-    "Manages the share registry, the list of shared folders that can be indexed.\n"
+    "       orvex share pause|resume|check-recycle NAME\n"
+    "       orvex share forget NAME PATH\n"
+    "       orvex share rename FROM TO\n"
+    "       orvex share migrate NAME FROM_PATH TO_PATH\n"
+    "Manages the share registry, the list of shared folders that can be indexed,\n"
+    "and the indexing of each share.\n"
     "Run `orvex share SUBCOMMAND --help` for details.\n";
 
 constexpr char kAddUsage[] =
@@ -257,6 +262,12 @@ int RunShareCommand(const Args& args) {
       {"add", Add},
       {"list", List},
       {"remove", Remove},
+      {"pause", SharePauseCommand},
+      {"resume", ShareResumeCommand},
+      {"forget", ShareForgetCommand},
+      {"rename", ShareRenameCommand},
+      {"migrate", ShareMigrateCommand},
+      {"check-recycle", ShareCheckRecycleCommand},
   };
   return RunSubcommand(args, "share", kSubcommands, kShareUsage);
 }

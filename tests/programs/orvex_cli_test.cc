@@ -92,9 +92,13 @@ TEST_F(OrvexCliTest, EveryBadCommandLineGetsItsOwnMessageAndStatus2ChangingNothi
       {{}, "120: missing command", "usage: orvex COMMAND"},
       {{"frobnicate"}, "120: unknown command \"frobnicate\"", "usage: orvex COMMAND"},
       {{"--bogus"}, "120: unknown option \"--bogus\"", "usage: orvex COMMAND"},
-      {{"share"}, "120: missing share subcommand (add, list or remove)", "usage: orvex share add"},
+      {{"share"},
+       "120: missing share subcommand (add, list, remove, pause, resume, forget, rename, migrate "
+       "or check-recycle)",
+       "usage: orvex share add"},
       {{"share", "move"},
-       "120: unknown share subcommand \"move\" (add, list or remove)",
+       "120: unknown share subcommand \"move\" (add, list, remove, pause, resume, forget, "
+       "rename, migrate or check-recycle)",
        "usage: orvex share add"},
       {{"share", "add", "music"}, "120: missing PATH", "usage: orvex share add"},
       {{"share", "add", "music", "{root}/srv", "--ro"},
