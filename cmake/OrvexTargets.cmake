@@ -102,6 +102,10 @@ function(orvex_programs)
           # The one program that runs the parsers, in its worker processes.
           target_link_libraries(${prog} PRIVATE orvex_extractd orvex_extract)
         endif()
+        if(prog STREQUAL "kaloelasticd")
+          # The search daemon's engine: SQLite stays out of everything else.
+          target_link_libraries(${prog} PRIVATE orvex_searchd)
+        endif()
         if(prog STREQUAL "kalonotifyd")
           # The watcher's loop lives in its own library, which its tests share.
           target_link_libraries(${prog} PRIVATE orvex_watch)

@@ -1,7 +1,7 @@
 #include "search/case_fold.h"
 
-#include <unicode/unistr.h>
 #include <unicode/uchar.h>
+#include <unicode/unistr.h>
 
 namespace orvex {
 namespace search {

@@ -52,6 +52,15 @@ void IndexRegistry::Remove(const std::string& id) {
   indexes_ = std::move(next);
 }
 
+void IndexRegistry::Rename(const std::string& id, const std::string& new_id,
+                           const IndexRecord& record) {
+  auto next = indexes_;
+  next.erase(id);
+  next[new_id] = record;
+  Save(next);
+  indexes_ = std::move(next);
+}
+
 void IndexRegistry::Save(const std::map<std::string, IndexRecord>& next) {
   Json::Value root;
   root["indexes"] = Json::Value(Json::arrayValue);

@@ -32,6 +32,8 @@ class IndexRegistry {
   // registry then unchanged, in memory and on disk) when it cannot be.
   void Put(const std::string& id, const IndexRecord& record);
   void Remove(const std::string& id);
+  // Replaces id by new_id with record, in one write.
+  void Rename(const std::string& id, const std::string& new_id, const IndexRecord& record);
 
  private:
   void Save(const std::map<std::string, IndexRecord>& next);

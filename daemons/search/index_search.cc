@@ -13,6 +13,10 @@ namespace {
 // Fragments shorter than this cannot use the trigram index: they scan the
 // stored folded names instead.
 constexpr size_t kTrigram = 3;
+// Above this many name matches, hits in name order are found by walking the
+// name index and keeping the matches (it stops at the page's end); below
+// it, fetching the matches and sorting them is cheaper.
+constexpr int64_t kWalkNameIndexAbove = 1000;
 
 std::string Quoted(const std::string& text) {
   std::string out = "\"";
@@ -54,13 +58,16 @@ std::string TextMatch(const std::string& query) {
   return match;
 }
 
+// Ties go by path in the same direction, so that a descending name order is
+// the name index read backwards.
 std::string OrderBy(const SearchQuery& q, bool has_text) {
-  const char* dir = q.descending ? " DESC" : "";
-  if (q.sort == "relevance" && has_text) return std::string(" ORDER BY rank") + dir + ", d.path";
-  if (q.sort == "path") return std::string(" ORDER BY d.path") + dir;
-  if (q.sort == "size") return std::string(" ORDER BY d.size") + dir + ", d.path";
-  if (q.sort == "mtime") return std::string(" ORDER BY d.mtime") + dir + ", d.path";
-  return std::string(" ORDER BY d.folded_name") + dir + ", d.path";
+  const std::string dir = q.descending ? " DESC" : "";
+  const std::string tie = ", d.path" + dir;
+  if (q.sort == "relevance" && has_text) return " ORDER BY rank" + dir + tie;
+  if (q.sort == "path") return " ORDER BY d.path" + dir;
+  if (q.sort == "size") return " ORDER BY d.size" + dir + tie;
+  if (q.sort == "mtime") return " ORDER BY d.mtime" + dir + tie;
+  return " ORDER BY d.folded_name" + dir + tie;
 }
 
 // The filter part of the query and its bindings, in order.
@@ -121,21 +128,29 @@ std::optional<int64_t> OptionalInt(const Statement& s, int column) {
 
 SearchResult IndexStore::Search(const SearchQuery& q) {
   const bool has_text = !q.text.empty();
-  const Filter f = BuildFilter(q, FoldCase(q.name));
-  const std::string from = has_text ? " FROM words JOIN documents d ON d.id = words.rowid WHERE 1"
-                                    : " FROM documents d WHERE 1";
+  const std::string folded = FoldCase(q.name);
+  const Filter f = BuildFilter(q, folded);
+  const bool by_trigram = CodePointCount(folded) >= kTrigram;
+  // The name alone: the trigram index counts its matches without visiting
+  // a single document.
+  const bool name_only = by_trigram && f.int_args.empty() && f.text_args.size() == 1;
+  std::string from = has_text ? " FROM words JOIN documents d ON d.id = words.rowid WHERE 1"
+                              : " FROM documents d WHERE 1";
   SearchResult result;
-  Statement count(*reader_, "SELECT count(*)" + from + f.where);
+  Statement count(*reader_, name_only ? "SELECT count(*) FROM name_grams WHERE name_grams MATCH ?"
+                                      : "SELECT count(*)" + from + f.where);
   Bind(count, f);
   count.Step();
   result.total = count.Int(0);
   count.Reset();
-  const std::string snippet =
-      has_text ? "snippet(words, -1, '[', ']', '...', 12), rank" : "'', 0";
+  if (by_trigram && !has_text && q.sort == "name" && result.total > kWalkNameIndexAbove) {
+    from = " FROM documents d INDEXED BY documents_folded_name WHERE 1";
+  }
+  const std::string snippet = has_text ? "snippet(words, -1, '[', ']', '...', 12), rank" : "'', 0";
   Statement rows(*reader_,
                  "SELECT d.path, d.name, d.type, d.is_dir, d.size, d.mtime, d.ctime, d.crtime, "
-                 "d.owner, d.folded_name, " + snippet + from + f.where + OrderBy(q, has_text) +
-                     " LIMIT ?");
+                 "d.owner, d.folded_name, " +
+                     snippet + from + f.where + OrderBy(q, has_text) + " LIMIT ?");
   const int next = Bind(rows, f);
   rows.Bind(next, q.offset + q.limit);
   while (rows.Step()) {

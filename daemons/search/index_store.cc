@@ -44,7 +44,7 @@ CREATE INDEX IF NOT EXISTS documents_mtime ON documents(mtime);
 CREATE INDEX IF NOT EXISTS documents_ctime ON documents(ctime);
 CREATE INDEX IF NOT EXISTS documents_crtime ON documents(crtime);
 CREATE INDEX IF NOT EXISTS documents_owner ON documents(owner);
-CREATE INDEX IF NOT EXISTS documents_folded_name ON documents(folded_name);
+CREATE INDEX IF NOT EXISTS documents_folded_name ON documents(folded_name, path);
 CREATE TABLE IF NOT EXISTS contents(id INTEGER PRIMARY KEY, text TEXT NOT NULL, props TEXT NOT NULL);
 CREATE VIRTUAL TABLE IF NOT EXISTS name_grams USING fts5(
   folded_name, content='documents', content_rowid='id', tokenize='trigram case_sensitive 1');
@@ -81,10 +81,11 @@ constexpr char kColumns[] =
 // Searched as words when no schema was given: the text properties that
 // content extraction fills.
 const char* const kDefaultTextProperties[] = {
-    "KALOMDTitle",         "KALOMDAuthors",     "KALOMDAlbum",    "KALOMDCreator",
-    "KALOMDMusicalGenre",  "KALOMDComposer",    "KALOMDComment",  "KALOMDCodecs",
-    "KALOMDDescription",   "KALOMDAcquisitionMake", "KALOMDAcquisitionModel",
-    "KALOMDKeywords",      "_KALOMDUserTags",   "KALOMDSpotlightBoost"};
+    "KALOMDTitle",           "KALOMDAuthors",          "KALOMDAlbum",
+    "KALOMDCreator",         "KALOMDMusicalGenre",     "KALOMDComposer",
+    "KALOMDComment",         "KALOMDCodecs",           "KALOMDDescription",
+    "KALOMDAcquisitionMake", "KALOMDAcquisitionModel", "KALOMDKeywords",
+    "_KALOMDUserTags",       "KALOMDSpotlightBoost"};
 
 std::string StringMember(const Json::Value& doc, const char* key) {
   const Json::Value& v = doc[key];
@@ -183,24 +184,28 @@ struct IndexStore::Statements {
                "type = ?5, extension = ?6, is_dir = ?7, size = ?8, mtime = ?9, ctime = ?10, "
                "crtime = ?11, owner = ?12, body = ?13 WHERE id = ?14"),
         insert_content(w, "INSERT INTO contents(id, text, props) VALUES (?1, ?2, ?3)"),
-        update_content(w, "UPDATE contents SET text = ?2, props = ?3 WHERE id = ?1 AND "
-                          "(text IS NOT ?2 OR props IS NOT ?3)"),
+        update_content(w,
+                       "UPDATE contents SET text = ?2, props = ?3 WHERE id = ?1 AND "
+                       "(text IS NOT ?2 OR props IS NOT ?3)"),
         remove(w, "DELETE FROM documents WHERE id = ?1"),
         remove_prefix(w, "DELETE FROM documents WHERE path >= ?1 AND path < ?2"),
         get_prefix(w, "SELECT body FROM documents WHERE path >= ?1 AND path < ?2 ORDER BY path"),
         begin(w, "BEGIN IMMEDIATE"),
+        savepoint(w, "SAVEPOINT command"),
+        release(w, "RELEASE command"),
+        rollback_to(w, "ROLLBACK TO command"),
         commit(w, "COMMIT"),
         rollback(w, "ROLLBACK") {}
   Statement find, load, insert, update, insert_content, update_content, remove, remove_prefix,
-      get_prefix, begin, commit, rollback;
+      get_prefix, begin, savepoint, release, rollback_to, commit, rollback;
 };
 
 IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
   if (create) {
     std::error_code ec;
     std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
-    if (ec) throw SearchError(kStorage, "cannot create the directory of " + path + ": " +
-                                            ec.message());
+    if (ec)
+      throw SearchError(kStorage, "cannot create the directory of " + path + ": " + ec.message());
   }
   writer_ = std::make_unique<SqliteDb>(path, create);
   ExecPragmas(*writer_);
@@ -214,7 +219,7 @@ IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
 IndexStore::~IndexStore() {
   // A stop or a crash drops what was not committed: the indexer sends it
   // again from its queue, as after kill -9.
-  if (in_transaction_) {
+  if (writer_ && InTransaction()) {
     try {
       Rollback();
     } catch (const SearchError&) {
@@ -258,22 +263,35 @@ void IndexStore::SetMappings(const Json::Value& mappings) {
   LoadMappings();
 }
 
+bool IndexStore::InTransaction() const { return sqlite3_get_autocommit(writer_->handle()) == 0; }
+
 void IndexStore::Begin() {
-  if (in_transaction_) return;
-  st_->begin.Run();
-  in_transaction_ = true;
+  if (!InTransaction()) st_->begin.Run();
 }
 
 void IndexStore::Commit() {
-  if (!in_transaction_) return;
-  st_->commit.Run();
-  in_transaction_ = false;
+  if (InTransaction()) st_->commit.Run();
 }
 
 void IndexStore::Rollback() {
-  if (!in_transaction_) return;
-  in_transaction_ = false;
-  st_->rollback.Run();
+  if (InTransaction()) st_->rollback.Run();
+}
+
+template <typename Change>
+auto IndexStore::Atomically(Change change) {
+  Begin();
+  st_->savepoint.Run();
+  try {
+    auto result = change();
+    st_->release.Run();
+    return result;
+  } catch (...) {
+    if (InTransaction()) {
+      st_->rollback_to.Run();
+      st_->release.Run();
+    }
+    throw;
+  }
 }
 
 void IndexStore::CheckTypes(const Json::Value& doc) const {
@@ -307,14 +325,16 @@ IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, Json::Value doc) 
   doc["KALOMDPath"] = row.path;
   const size_t slash = row.path.rfind('/');
   row.name = StringMember(view, "KALOMDFSName");
-  if (row.name.empty()) row.name = slash == std::string::npos ? row.path : row.path.substr(slash + 1);
+  if (row.name.empty())
+    row.name = slash == std::string::npos ? row.path : row.path.substr(slash + 1);
   row.parent = StringMember(view, "KALOMDParent");
   if (row.parent.empty() && slash != std::string::npos) row.parent = row.path.substr(0, slash);
   std::string search_name = StringMember(view, "KALOMDSearchFileName");
   if (search_name.empty()) search_name = row.name;
   row.folded_name = FoldCase(search_name);
-  row.extension = view["KALOMDExtension"].isString() ? LowerAscii(view["KALOMDExtension"].asString())
-                                                    : ExtensionOf(row.name);
+  row.extension = view["KALOMDExtension"].isString()
+                      ? LowerAscii(view["KALOMDExtension"].asString())
+                      : ExtensionOf(row.name);
   row.is_dir = view["KALOMDIsDir"].isBool() && view["KALOMDIsDir"].asBool();
   row.type = TypeName(row.is_dir, row.extension);
   row.size = IntMember(view, "KALOMDFSSize");
@@ -322,7 +342,7 @@ IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, Json::Value doc) 
   row.ctime = IntMember(view, "KALOMDAttributeChangeDate");
   row.crtime = IntMember(view, "KALOMDFSCreationDate");
   const Json::Value& owner = view["KALOMDOwnerUserID"];
-  row.owner = owner.isString() ? owner.asString()
+  row.owner = owner.isString()     ? owner.asString()
               : owner.isIntegral() ? std::to_string(owner.asInt64())
                                    : std::string();
   row.text = StringMember(view, "KALOMDTextContent");
@@ -378,36 +398,40 @@ void IndexStore::Update(int64_t id, const Row& row) {
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc) {
   CheckTypes(doc);
   const Row row = MakeRow(doc_id, doc);
-  Begin();
-  if (const auto id = FindId(doc_id)) st_->remove.Bind(1, *id).Run();
-  if (row.path != doc_id) {
-    if (const auto id = FindId(row.path)) st_->remove.Bind(1, *id).Run();
-  }
-  Insert(row);
+  Atomically([&] {
+    if (const auto id = FindId(doc_id)) st_->remove.Bind(1, *id).Run();
+    if (row.path != doc_id) {
+      if (const auto id = FindId(row.path)) st_->remove.Bind(1, *id).Run();
+    }
+    Insert(row);
+    return true;
+  });
 }
 
 void IndexStore::Set(const std::string& doc_id, const Json::Value& changes) {
   CheckTypes(changes);
-  Begin();
-  Statement& load = st_->load;
-  load.Bind(1, doc_id);
-  if (!load.Step()) {
+  Atomically([&] {
+    Statement& load = st_->load;
+    load.Bind(1, doc_id);
+    if (!load.Step()) {
+      load.Reset();
+      throw SearchError(kNoSuchDocument, "no document " + doc_id);
+    }
+    const int64_t id = load.Int(0);
+    Json::Value doc;
+    const bool parsed = fromString(doc, load.Text(1));
+    const std::string text = load.Text(2);
     load.Reset();
-    throw SearchError(kNoSuchDocument, "no document " + doc_id);
-  }
-  const int64_t id = load.Int(0);
-  Json::Value doc;
-  const bool parsed = fromString(doc, load.Text(1));
-  const std::string text = load.Text(2);
-  load.Reset();
-  if (!parsed || !doc.isObject()) throw SearchError(kStorage, "unreadable document " + doc_id);
-  if (!text.empty()) doc["KALOMDTextContent"] = text;
-  for (const std::string& name : changes.getMemberNames()) doc[name] = changes[name];
-  const Row row = MakeRow(doc_id, doc);
-  if (row.path != doc_id) {
-    if (const auto other = FindId(row.path)) st_->remove.Bind(1, *other).Run();
-  }
-  Update(id, row);
+    if (!parsed || !doc.isObject()) throw SearchError(kStorage, "unreadable document " + doc_id);
+    if (!text.empty()) doc["KALOMDTextContent"] = text;
+    for (const std::string& name : changes.getMemberNames()) doc[name] = changes[name];
+    const Row row = MakeRow(doc_id, doc);
+    if (row.path != doc_id) {
+      if (const auto other = FindId(row.path)) st_->remove.Bind(1, *other).Run();
+    }
+    Update(id, row);
+    return true;
+  });
 }
 
 bool IndexStore::Delete(const std::string& doc_id) {
@@ -446,7 +470,7 @@ Json::Value IndexStore::Stats() {
     if (::stat((path_ + suffix).c_str(), &st) == 0) bytes += st.st_size;
   }
   out["bytes"] = static_cast<Json::Int64>(bytes);
-  out["uncommitted"] = in_transaction_;
+  out["uncommitted"] = InTransaction();
   return out;
 }
 

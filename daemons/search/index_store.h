@@ -28,8 +28,8 @@ struct SearchQuery {
   std::string extension;  // without its dot, any case
   std::optional<int64_t> size_min, size_max;
   std::optional<int64_t> mtime_min, mtime_max;  // KALOMDFSContentChangeDate
-  std::string folder;     // only documents below this full path
-  std::string owner;      // only documents of this user id (permission trimming)
+  std::string folder;                           // only documents below this full path
+  std::string owner;          // only documents of this user id (permission trimming)
   std::string sort = "name";  // "name", "path", "size", "mtime" or "relevance"
   bool descending = false;
   int64_t offset = 0;
@@ -83,7 +83,9 @@ class IndexStore {
   void Commit();
   // Drops the changes since the last commit.
   void Rollback();
-  bool InTransaction() const { return in_transaction_; }
+  // Asked of SQLite itself: a failed COMMIT (a full disk) may have ended the
+  // transaction, and the next change must then open a new one.
+  bool InTransaction() const;
 
   // Up to offset + limit best hits by the query's order (the caller slices:
   // hits of several indexes are merged first), and the total count. Only
@@ -104,6 +106,10 @@ class IndexStore {
   struct Statements;
 
   void Begin();
+  // Runs change as one unit inside the open transaction: when it throws,
+  // whatever part of it was done is undone and the earlier changes stay.
+  template <typename Change>
+  auto Atomically(Change change);
   void CheckTypes(const Json::Value& doc) const;
   std::optional<int64_t> FindId(const std::string& path);
   Row MakeRow(const std::string& doc_id, Json::Value doc) const;
@@ -115,9 +121,9 @@ class IndexStore {
   std::unique_ptr<SqliteDb> writer_;
   std::unique_ptr<SqliteDb> reader_;
   std::unique_ptr<Statements> st_;
-  bool in_transaction_ = false;
-  std::map<std::string, std::string> types_;   // property -> "int", "double", "bool", "string", "text"
-  std::vector<std::string> text_properties_;   // those searched as words
+  std::map<std::string, std::string>
+      types_;  // property -> "int", "double", "bool", "string", "text"
+  std::vector<std::string> text_properties_;  // those searched as words
 };
 
 // The smallest string greater than every string that begins with prefix,

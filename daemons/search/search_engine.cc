@@ -27,13 +27,15 @@ const Json::Value& Member(const Json::Value& data, const char* key) {
 
 std::string StringArg(const Json::Value& data, const char* key) {
   const Json::Value& v = Member(data, key);
-  if (!v.isString()) throw SearchError(kBadArgument, std::string("\"") + key + "\" must be a string");
+  if (!v.isString())
+    throw SearchError(kBadArgument, std::string("\"") + key + "\" must be a string");
   return v.asString();
 }
 
 const Json::Value& ObjectArg(const Json::Value& data, const char* key) {
   const Json::Value& v = Member(data, key);
-  if (!v.isObject()) throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an object");
+  if (!v.isObject())
+    throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an object");
   return v;
 }
 
@@ -96,8 +98,8 @@ SearchQuery ParseQuery(const Json::Value& data) {
   q.offset = OptionalIntArg(data, "offset").value_or(0);
   q.limit = OptionalIntArg(data, "limit").value_or(50);
   if (q.offset < 0 || q.limit < 0 || q.limit > kMaxLimit) {
-    throw SearchError(kBadArgument, "\"offset\" must be >= 0 and \"limit\" 0 to " +
-                                        std::to_string(kMaxLimit));
+    throw SearchError(kBadArgument,
+                      "\"offset\" must be >= 0 and \"limit\" 0 to " + std::to_string(kMaxLimit));
   }
   return q;
 }
@@ -106,7 +108,7 @@ SearchQuery ParseQuery(const Json::Value& data) {
 bool Before(const SearchHit& a, const SearchHit& b, const SearchQuery& q) {
   auto by = [&](auto key_a, auto key_b) {
     if (key_a != key_b) return q.descending ? key_b < key_a : key_a < key_b;
-    return a.path < b.path;
+    return q.descending ? b.path < a.path : a.path < b.path;
   };
   if (q.sort == "relevance" && !q.text.empty()) return by(a.rank, b.rank);
   if (q.sort == "path") return by(a.path, b.path);
@@ -145,8 +147,9 @@ SearchResult ReadableHits(IndexStore& store, const SearchQuery& q, const Viewer&
   for (;;) {
     SearchResult result = store.Search(page);
     const int64_t fetched = static_cast<int64_t>(result.hits.size());
-    const auto unreadable = std::remove_if(result.hits.begin(), result.hits.end(),
-                                           [&](const SearchHit& hit) { return !CanRead(hit.path, viewer); });
+    const auto unreadable =
+        std::remove_if(result.hits.begin(), result.hits.end(),
+                       [&](const SearchHit& hit) { return !CanRead(hit.path, viewer); });
     const int64_t hidden = result.hits.end() - unreadable;
     result.hits.erase(unreadable, result.hits.end());
     const bool exhausted = fetched < page.limit;
@@ -163,8 +166,8 @@ SearchResult ReadableHits(IndexStore& store, const SearchQuery& q, const Viewer&
 std::string CheckIndexId(const Json::Value& id) {
   if (!id.isString()) throw SearchError(kBadArgument, "\"id\" must be a string");
   const std::string text = id.asString();
-  if (text.empty() || text.find('/') != std::string::npos ||
-      text.find("..") != std::string::npos || text.find('\0') != std::string::npos) {
+  if (text.empty() || text.find('/') != std::string::npos || text.find("..") != std::string::npos ||
+      text.find('\0') != std::string::npos) {
     throw SearchError(kBadIndexId, "bad index id \"" + text + "\": empty, or holds / or ..");
   }
   return text;
@@ -325,8 +328,8 @@ Json::Value SearchEngine::IndexConfigSet(const Json::Value& data) {
   const IndexRecord* record = registry_.Find(id);
   if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
   const std::string new_id = change.isMember("id") ? CheckIndexId(change["id"]) : id;
-  const std::string new_path = change.isMember("path") ? AbsolutePathArg(change, "path")
-                                                       : record->path;
+  const std::string new_path =
+      change.isMember("path") ? AbsolutePathArg(change, "path") : record->path;
   if (new_id != id && registry_.Find(new_id) != nullptr) {
     throw SearchError(kIndexExists, "index \"" + new_id + "\" exists");
   }
@@ -339,11 +342,12 @@ Json::Value SearchEngine::IndexConfigSet(const Json::Value& data) {
   const std::string old_path = record->path;
   CloseStore(id);
   if (new_path != old_path) MoveStoreFile(old_path, new_path);
-  if (new_id != id) {
-    registry_.Put(new_id, moved);
-    registry_.Remove(id);
-  } else {
-    registry_.Put(id, moved);
+  try {
+    registry_.Rename(id, new_id, moved);
+  } catch (const SearchError&) {
+    // The registry still names the old place: put the database back there.
+    if (new_path != old_path) MoveStoreFile(new_path, old_path);
+    throw;
   }
   return Json::Value(Json::objectValue);
 }
@@ -393,7 +397,8 @@ Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) 
   std::vector<std::string> ids;
   if (data.isMember("id")) {
     ids.push_back(CheckIndexId(data["id"]));
-    if (registry_.Find(ids[0]) == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + ids[0] + "\"");
+    if (registry_.Find(ids[0]) == nullptr)
+      throw SearchError(kNoSuchIndex, "no index \"" + ids[0] + "\"");
   } else {
     for (const auto& entry : registry_.indexes()) ids.push_back(entry.first);
   }
@@ -403,8 +408,8 @@ Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) 
   for (const std::string& id : ids) {
     const Visibility visibility = IndexVisibility(id, viewer);
     if (visibility == Visibility::kNone) continue;
-    SearchResult result = visibility == Visibility::kAll ? Store(id).Search(q)
-                                                         : ReadableHits(Store(id), q, viewer);
+    SearchResult result =
+        visibility == Visibility::kAll ? Store(id).Search(q) : ReadableHits(Store(id), q, viewer);
     total += result.total;
     for (SearchHit& hit : result.hits) hits.emplace_back(std::move(hit), id);
   }

@@ -14,18 +14,18 @@ namespace search {
 // Codes of the daemon's answers. 1400 is the one the client retries: it is
 // given only when taking a request would break the daemon's memory bound.
 enum SearchCode : int {
-  kBadFrame = 1100,         // length 0, above the cap, or cut short
-  kBadJson = 1101,          // not a JSON object
-  kUnknownCommand = 1102,   // "command" names nothing this daemon does
-  kBadArgument = 1103,      // a member missing or of the wrong type
-  kBadIndexId = 1104,       // an index id that is empty, or holds "/" or ".."
-  kNoSuchIndex = 1105,      // no index with that id
-  kIndexExists = 1106,      // the id (or new id) is taken by another index
-  kNoSuchDocument = 1107,   // document_set_by_id of a document never upserted
-  kStorage = 1108,          // SQLite or the file system failed
-  kNotPermitted = 1109,     // a user asked to search as someone else
-  kAnswerTooLarge = 1110,   // the answer would not fit one frame
-  kBusy = 1400,             // over the memory bound: try again later
+  kBadFrame = 1100,        // length 0, above the cap, or cut short
+  kBadJson = 1101,         // not a JSON object
+  kUnknownCommand = 1102,  // "command" names nothing this daemon does
+  kBadArgument = 1103,     // a member missing or of the wrong type
+  kBadIndexId = 1104,      // an index id that is empty, or holds "/" or ".."
+  kNoSuchIndex = 1105,     // no index with that id
+  kIndexExists = 1106,     // the id (or new id) is taken by another index
+  kNoSuchDocument = 1107,  // document_set_by_id of a document never upserted
+  kStorage = 1108,         // SQLite or the file system failed
+  kNotPermitted = 1109,    // a user asked to search as someone else
+  kAnswerTooLarge = 1110,  // the answer would not fit one frame
+  kBusy = 1400,            // over the memory bound: try again later
 };
 
 class SearchError : public std::runtime_error {

@@ -62,11 +62,11 @@ struct SearchServer::Connection {
   Caller caller;
   char header[kHeaderBytes] = {};
   size_t header_bytes = 0;
-  uint32_t length = 0;      // of the frame being read; 0 while reading its header
-  size_t reserved = 0;      // bytes of held_bytes_ counted for this frame
-  size_t discard = 0;       // body bytes still to drop before answering busy
+  uint32_t length = 0;  // of the frame being read; 0 while reading its header
+  size_t reserved = 0;  // bytes of held_bytes_ counted for this frame
+  size_t discard = 0;   // body bytes still to drop before answering busy
   std::string body;
-  std::string out;          // the framed answer being written
+  std::string out;  // the framed answer being written
   size_t written = 0;
   bool close_after = false;  // close once out is written
   bool closed = false;
@@ -159,8 +159,9 @@ void SearchServer::OnHeader(Connection& c) {
   c.header_bytes = 0;
   if (c.length == 0 || c.length > options_.max_frame) {
     // The stream cannot be trusted past a bad length word: answer and close.
-    Answer(c, ErrorText(kBadFrame, "bad frame length " + std::to_string(c.length) +
-                                       " (1 to " + std::to_string(options_.max_frame) + ")"),
+    Answer(c,
+           ErrorText(kBadFrame, "bad frame length " + std::to_string(c.length) + " (1 to " +
+                                    std::to_string(options_.max_frame) + ")"),
            /*close_after=*/true);
     c.length = 0;
     return;
@@ -213,8 +214,9 @@ void SearchServer::OnReadable(Connection& c) {
         // The client may have shut only its sending side: tell it why.
         const size_t got = c.length > 0 ? c.body.size() : c.header_bytes;
         Release(c);
-        Answer(c, ErrorText(kBadFrame, "the connection ended " + std::to_string(got) +
-                                           " bytes into a frame"),
+        Answer(c,
+               ErrorText(kBadFrame,
+                         "the connection ended " + std::to_string(got) + " bytes into a frame"),
                /*close_after=*/true);
         c.length = 0;
         c.discard = 0;

@@ -28,11 +28,11 @@ namespace search {
 inline constexpr char kSearchSocketPath[] = "/var/run/kaloelasticd.sock";
 
 struct ServerOptions {
-  std::string socket_path;                // as given (already under ORVEX_ROOT)
-  uint32_t max_frame = 64u << 20;         // the largest request or answer
-  size_t max_connections = 256;           // more wait in the listen backlog
+  std::string socket_path;                  // as given (already under ORVEX_ROOT)
+  uint32_t max_frame = 64u << 20;           // the largest request or answer
+  size_t max_connections = 256;             // more wait in the listen backlog
   size_t memory_bound = size_t{256} << 20;  // bytes held for all connections
-  int idle_timeout_ms = 120000;           // a silent connection is closed after this
+  int idle_timeout_ms = 120000;             // a silent connection is closed after this
 };
 
 class SearchServer {

@@ -6,8 +6,7 @@ namespace orvex {
 namespace search {
 
 SqliteDb::SqliteDb(const std::string& path, bool create) : path_(path) {
-  const int flags = SQLITE_OPEN_READWRITE | (create ? SQLITE_OPEN_CREATE : 0) |
-                    SQLITE_OPEN_NOMUTEX;
+  const int flags = SQLITE_OPEN_READWRITE | (create ? SQLITE_OPEN_CREATE : 0) | SQLITE_OPEN_NOMUTEX;
   if (sqlite3_open_v2(path.c_str(), &db_, flags, nullptr) != SQLITE_OK) {
     const std::string why = db_ ? sqlite3_errmsg(db_) : "out of memory";
     sqlite3_close(db_);
@@ -33,8 +32,8 @@ void SqliteDb::Fail(const std::string& what) const {
 
 Statement::Statement(SqliteDb& db, const std::string& sql) : db_(&db), sql_(sql) {
   sqlite3_stmt* raw = nullptr;
-  if (sqlite3_prepare_v3(db.handle(), sql.c_str(), -1, SQLITE_PREPARE_PERSISTENT, &raw,
-                         nullptr) != SQLITE_OK) {
+  if (sqlite3_prepare_v3(db.handle(), sql.c_str(), -1, SQLITE_PREPARE_PERSISTENT, &raw, nullptr) !=
+      SQLITE_OK) {
     db.Fail(sql);
   }
   stmt_.reset(raw);

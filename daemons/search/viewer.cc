@@ -41,7 +41,8 @@ std::string UserName(uid_t uid) {
 Viewer ResolveViewer(const Json::Value& data, const Caller& caller) {
   Viewer viewer;
   const Json::Value& named = data["user"];
-  if (!named.isNull() && !named.isString()) throw SearchError(kBadArgument, "\"user\" must be a string");
+  if (!named.isNull() && !named.isString())
+    throw SearchError(kBadArgument, "\"user\" must be a string");
   if (caller.uid == 0 && named.isNull()) return viewer;
   const std::string own = UserName(caller.uid);
   const std::string user = named.isString() ? named.asString() : own;

@@ -1,0 +1,178 @@
+// kaloelasticd: the search daemon. Keeps one SQLite index per share and
+// carries out the search-engine client's commands and users' searches on
+// /var/run/kaloelasticd.sock (under ORVEX_ROOT when set).
+//
+//   kaloelasticd [--foreground]
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/signalfd.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <iostream>
+#include <memory>
+#include <stdexcept>
+#include <string>
+
+#include "orvex/portable/atomic_file.h"
+#include "orvex/portable/file_descriptor.h"
+#include "orvex/portable/root.h"
+#include "orvex/version.h"
+#include "search/index_registry.h"
+#include "search/search_engine.h"
+#include "search/search_error.h"
+#include "search/search_server.h"
+
+namespace {
+
+using orvex::portable::RootPath;
+
+constexpr char kIdent[] = "kaloelasticd";
+constexpr char kPidPath[] = "/var/run/kaloelasticd.pid";
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = 2;
+constexpr int kRoundMs = 60000;  // any wait ends sooner on a request or a signal
+
+constexpr char kUsage[] =
+    "usage: kaloelasticd [--foreground]\n"
+    "The search daemon: one SQLite index per share, the indexer's document\n"
+    "commands and users' searches on /var/run/kaloelasticd.sock (under\n"
+    "ORVEX_ROOT when set; mode 0660). The set of indexes is kept in\n"
+    "/var/lib/orvex/kaloelasticd/indexes.json. The protocol is described in\n"
+    "doc/search_protocol.md.\n"
+    "  --foreground  stay in the foreground (otherwise it detaches once its\n"
+    "                socket is ready, and writes its pid to\n"
+    "                /var/run/kaloelasticd.pid)\n"
+    "  --help, --version\n"
+    "Exit status: 0 on SIGTERM or SIGINT (the answers being written are\n"
+    "finished; changes not committed are dropped), 1 when it cannot start,\n"
+    "2 bad usage.\n";
+
+struct Options {
+  bool help = false;
+  bool version = false;
+  bool foreground = false;
+};
+
+Options ParseArgs(int argc, char** argv) {
+  Options opt;
+  for (int i = 1; i < argc; ++i) {
+    const std::string arg = argv[i];
+    if (arg == "--help") {
+      opt.help = true;
+    } else if (arg == "--version") {
+      opt.version = true;
+    } else if (arg == "--foreground") {
+      opt.foreground = true;
+    } else {
+      throw std::invalid_argument("unknown argument " + arg);
+    }
+  }
+  return opt;
+}
+
+// SIGTERM and SIGINT arrive through a descriptor the loop waits on, so a
+// stop is seen at once and never between a check and a wait.
+orvex::FileDescriptor StopSignals() {
+  sigset_t stop;
+  sigemptyset(&stop);
+  sigaddset(&stop, SIGTERM);
+  sigaddset(&stop, SIGINT);
+  ::sigprocmask(SIG_BLOCK, &stop, nullptr);
+  ::signal(SIGPIPE, SIG_IGN);
+  return orvex::FileDescriptor(::signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+// Detaches: the parent returns once the child says its socket is ready (one
+// byte on the pipe) or has failed (the pipe closes empty), so that whoever
+// started the daemon can use it as soon as the command returns.
+int Detach(orvex::FileDescriptor& ready) {
+  int fds[2];
+  if (::pipe2(fds, O_CLOEXEC) != 0) return kExitFailure;
+  orvex::FileDescriptor read_end(fds[0]);
+  ready.reset(fds[1]);
+  const pid_t pid = ::fork();
+  if (pid < 0) return kExitFailure;
+  if (pid > 0) {
+    ready.reset();
+    char byte = 0;
+    ssize_t n;
+    while ((n = ::read(read_end.get(), &byte, 1)) < 0 && errno == EINTR) {
+    }
+    return n == 1 ? 0 : kExitFailure;
+  }
+  ::setsid();
+  if (::chdir("/") != 0) return kExitFailure;
+  const orvex::FileDescriptor null(::open("/dev/null", O_RDWR | O_CLOEXEC));
+  for (int fd = 0; fd <= 2; ++fd) ::dup2(null.get(), fd);
+  return -1;  // in the daemon: go on
+}
+
+void Complain(const std::string& why) {
+  syslog(LOG_ERR, "%s", why.c_str());
+  std::cerr << kIdent << ": " << why << "\n";
+}
+
+int Serve(const Options& opt) {
+  orvex::FileDescriptor ready;
+  if (!opt.foreground) {
+    const int status = Detach(ready);
+    if (status >= 0) return status;
+  }
+  ::openlog(kIdent, LOG_PID, LOG_DAEMON);
+  orvex::FileDescriptor stop = StopSignals();
+  std::unique_ptr<orvex::search::SearchEngine> engine;
+  try {
+    engine =
+        std::make_unique<orvex::search::SearchEngine>(RootPath(orvex::search::kIndexRegistryPath));
+  } catch (const orvex::search::SearchError& e) {
+    Complain(e.what());
+    return kExitFailure;
+  }
+  orvex::search::ServerOptions options;
+  options.socket_path = RootPath(orvex::search::kSearchSocketPath);
+  orvex::search::SearchServer server(options, *engine);
+  if (!stop || !server.Start()) {
+    Complain("cannot listen on " + options.socket_path + ": " + std::strerror(errno));
+    return kExitFailure;
+  }
+  server.set_wake_fd(stop.get());
+  const std::string pid_path = RootPath(kPidPath);
+  if (!opt.foreground) {
+    orvex::portable::WriteFileAtomic(pid_path, std::to_string(::getpid()) + "\n");
+    const char byte = 'r';
+    if (::write(ready.get(), &byte, 1) != 1) return kExitFailure;
+    ready.reset();
+  }
+  syslog(LOG_INFO, "listening on %s", options.socket_path.c_str());
+  while (!server.RunOnce(kRoundMs)) {
+  }
+  server.Stop();
+  engine.reset();  // drops what was not committed
+  if (!opt.foreground) ::unlink(pid_path.c_str());
+  syslog(LOG_INFO, "stopped");
+  return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options opt;
+  try {
+    opt = ParseArgs(argc, argv);
+  } catch (const std::invalid_argument& e) {
+    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
+    return kExitUsage;
+  }
+  if (opt.help) {
+    std::cout << kUsage;
+    return 0;
+  }
+  if (opt.version) {
+    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
+    return 0;
+  }
+  return Serve(opt);
+}

@@ -1,0 +1,329 @@
+// kaloelasticd as a real process in its own ORVEX_ROOT: started detached (the
+// command returns once the socket is ready), talked to by the library's own
+// search-engine client and by raw sockets, stopped with SIGTERM.
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+#include "kalo/kalo_sock.h"
+#include "orvex/elastic.h"
+#include "orvex/version.h"
+#include "search/search_error.h"
+#include "searchd/searchd_fixture.h"
+#include "support/run_program.h"
+
+namespace orvex {
+namespace testing {
+namespace {
+
+constexpr char kId[] = "fileindex_s";
+
+class KaloelasticdTest : public ::testing::Test {
+ protected:
+  void TearDown() override {
+    if (pid_ > 0) {
+      EXPECT_TRUE(Stop());
+    }
+  }
+
+  ProgramOutcome Run(const std::vector<std::string>& args) {
+    return RunProgram(program_, args, {"ORVEX_ROOT=" + root_.path()}, io_.path());
+  }
+
+  void Start() {
+    const ProgramOutcome started = Run({});
+    ASSERT_EQ(0, started.status) << started.err;
+    pid_ = std::stoi(ReadFileText(root_.Join("var/run/kaloelasticd.pid")));
+  }
+
+  // SIGTERM, then waits for the daemon (not our child) to be gone; false
+  // when it is still there after ten seconds.
+  bool Stop() {
+    const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
+    if (pidfd < 0) return false;
+    ::kill(pid_, SIGTERM);
+    struct pollfd p = {pidfd, POLLIN, 0};
+    const bool gone = ::poll(&p, 1, 10000) == 1;
+    ::close(pidfd);
+    pid_ = -1;
+    return gone;
+  }
+
+  std::string SocketPath() const { return root_.Join("var/run/kaloelasticd.sock"); }
+
+  Json::Value Ask(const Json::Value& request) {
+    kalodaemon::DomainSockConnection connection(SocketPath());
+    EXPECT_TRUE(connection.Connect()) << std::strerror(errno);
+    EXPECT_TRUE(connection.Send(toString(request)));
+    std::string answer;
+    EXPECT_TRUE(connection.Recv(answer)) << std::strerror(errno);
+    return ParseJson(answer);
+  }
+
+  Json::Value Ok(const Json::Value& request) {
+    const Json::Value answer = Ask(request);
+    EXPECT_TRUE(answer["success"].asBool()) << toString(request) << " -> " << toString(answer);
+    return answer;
+  }
+
+  // Reads one framed answer from a raw socket (blocking).
+  Json::Value ReadAnswer(int fd) {
+    uint32_t length = 0;
+    if (::recv(fd, &length, sizeof(length), MSG_WAITALL) != sizeof(length)) return Json::Value();
+    std::string body(length, '\0');
+    if (::recv(fd, &body[0], length, MSG_WAITALL) != static_cast<ssize_t>(length)) {
+      return Json::Value();
+    }
+    body.pop_back();
+    return ParseJson(body);
+  }
+
+  void CreateIndex() {
+    Json::Value req = Command("index_create", kId);
+    req["data"]["path"] = root_.Join("volume1/s/@eaDir/@fileindex/db");
+    req["data"]["settings"] = Json::Value(Json::objectValue);
+    req["data"]["mappings"] = fileindex::elastic::GetFileIndexMappings();
+    Ok(req);
+  }
+
+  void StillServing() {
+    Json::Value stats;
+    stats["command"] = "stats";
+    stats["data"] = Json::Value(Json::objectValue);
+    Ok(stats);
+  }
+
+  const std::string program_ = std::string(ORVEX_BUILD_DIR) + "/kaloelasticd";
+  TempDir root_;
+  TempDir io_;
+  ScopedOrvexRoot scoped_root_{root_.path()};
+  pid_t pid_ = -1;
+};
+
+TEST_F(KaloelasticdTest, HelpVersionAndBadUsage) {
+  ProgramOutcome run = Run({"--help"});
+  EXPECT_EQ(0, run.status);
+  EXPECT_NE(std::string::npos, run.out.find("--foreground"));
+  run = Run({"--version"});
+  EXPECT_EQ(0, run.status);
+  EXPECT_EQ(std::string("kaloelasticd ") + ORVEX_VERSION + "\n", run.out);
+  run = Run({"--bogus"});
+  EXPECT_EQ(2, run.status);
+  EXPECT_NE(std::string::npos, run.err.find("usage:"));
+}
+
+TEST_F(KaloelasticdTest, SocketIsMode0660AndASecondDaemonIsRefused) {
+  Start();
+  struct stat st;
+  ASSERT_EQ(0, ::stat(SocketPath().c_str(), &st));
+  EXPECT_TRUE(S_ISSOCK(st.st_mode));
+  EXPECT_EQ(0660u, st.st_mode & 07777);
+  const ProgramOutcome second = Run({});
+  EXPECT_EQ(1, second.status);
+  StillServing();
+}
+
+// A directory rename through the library's own IndexRename: one set, one
+// query, one compound of 1,000 sets.
+TEST_F(KaloelasticdTest, DirectoryRenameThroughTheLibraryMovesEveryDescendant) {
+  Start();
+  CreateIndex();
+  Json::Value compound;
+  auto dir = [](const std::string& path) {
+    Json::Value doc = FileDoc(path);
+    doc["KALOMDIsDir"] = true;
+    return doc;
+  };
+  compound["compound"].append(Upsert(kId, dir("/v/s/a")));
+  compound["compound"].append(Upsert(kId, dir("/v/s/ab")));
+  compound["compound"].append(Upsert(kId, FileDoc("/v/s/ab/keep.txt")));
+  for (int d = 0; d < 10; ++d) {
+    compound["compound"].append(Upsert(kId, dir("/v/s/a/d" + std::to_string(d))));
+  }
+  for (int i = 0; i < 990; ++i) {
+    compound["compound"].append(Upsert(
+        kId, FileDoc("/v/s/a/d" + std::to_string(i % 10) + "/f" + std::to_string(i) + ".txt")));
+  }
+  EXPECT_FALSE(Ok(compound)["has_fail"].asBool());
+  Ok(Command("commit", kId));
+
+  fileindex::elastic::IndexRename("s", "/v/s/a", "/v/s/b");
+  fileindex::elastic::IndexCommit("s");
+
+  const Json::Value moved = Ok(PrefixQuery("document_get_by_query", kId, "/v/s/b/"))["data"];
+  EXPECT_EQ(1000u, moved.size());
+  for (const Json::Value& doc : moved) {
+    const std::string path = doc["KALOMDPath"].asString();
+    EXPECT_EQ(path.substr(0, path.rfind('/')), doc["KALOMDParent"].asString()) << path;
+  }
+  EXPECT_EQ(0u, Ok(PrefixQuery("document_get_by_query", kId, "/v/s/a/"))["data"].size());
+  EXPECT_EQ((std::vector<std::string>{"/v/s/ab/keep.txt"}),
+            DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/ab/"))));
+  Json::Value search;
+  search["command"] = "search";
+  search["data"]["name"] = "f987.txt";
+  EXPECT_EQ(std::vector<std::string>{"/v/s/b/d7/f987.txt"}, HitPaths(Ok(search)));
+  search["data"] = Json::Value(Json::objectValue);
+  search["data"]["folder"] = "/v/s/a";
+  EXPECT_EQ(0, Ok(search)["data"]["total"].asInt());
+  search["data"]["folder"] = "/v/s";
+  search["data"]["type"] = "dir";
+  EXPECT_EQ((std::vector<std::string>{"/v/s/ab", "/v/s/b", "/v/s/b/d0", "/v/s/b/d1", "/v/s/b/d2",
+                                      "/v/s/b/d3", "/v/s/b/d4", "/v/s/b/d5", "/v/s/b/d6",
+                                      "/v/s/b/d7", "/v/s/b/d8", "/v/s/b/d9"}),
+            HitPaths(Ok(search)));
+}
+
+TEST_F(KaloelasticdTest, RestartKeepsWhatWasCommitted) {
+  Start();
+  CreateIndex();
+  Ok(Upsert(kId, FileDoc("/v/s/kept.txt")));
+  Ok(Command("commit", kId));
+  Ok(Upsert(kId, FileDoc("/v/s/dropped.txt")));
+  ASSERT_TRUE(Stop());
+  EXPECT_FALSE(std::filesystem::exists(SocketPath()));
+  Start();
+  EXPECT_EQ(std::vector<std::string>{"/v/s/kept.txt"},
+            DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/"))));
+}
+
+TEST_F(KaloelasticdTest, AfterKillNineTheNextDaemonTakesOverTheSocketAndTheLastCommit) {
+  Start();
+  CreateIndex();
+  Ok(Upsert(kId, FileDoc("/v/s/kept.txt")));
+  Ok(Command("commit", kId));
+  Ok(Upsert(kId, FileDoc("/v/s/lost.txt")));
+  const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
+  ASSERT_GE(pidfd, 0);
+  ASSERT_EQ(0, ::kill(pid_, SIGKILL));
+  struct pollfd gone = {pidfd, POLLIN, 0};
+  EXPECT_EQ(1, ::poll(&gone, 1, 10000));
+  ::close(pidfd);
+  pid_ = -1;
+  ASSERT_TRUE(std::filesystem::exists(SocketPath()));  // left behind
+  Start();
+  EXPECT_EQ(std::vector<std::string>{"/v/s/kept.txt"},
+            DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/"))));
+}
+
+TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
+  Start();
+  CreateIndex();
+  const struct {
+    const char* what;
+    std::string bytes;
+    bool shut_write;  // the client stops sending after these bytes
+    int code;
+  } cases[] = {
+      {"length 0", LengthWord(0), false, search::kBadFrame},
+      {"length 4 GiB", LengthWord(0xFFFFFFFFu), false, search::kBadFrame},
+      {"shorter than announced", LengthWord(100) + "{\"command\"", true, search::kBadFrame},
+      {"half a length word", std::string("\x10\x00", 2), true, search::kBadFrame},
+      {"not JSON", Framed("this is not json"), false, search::kBadJson},
+      {"unknown command", Framed(R"({"command": "explode", "data": {}})"), false,
+       search::kUnknownCommand},
+      {"id with ..", Framed(R"({"command": "commit", "data": {"id": "fileindex_.."}})"), false,
+       search::kBadIndexId},
+  };
+  for (const auto& c : cases) {
+    FileDescriptor fd = ConnectRaw(SocketPath());
+    ASSERT_TRUE(SendBytes(fd.get(), c.bytes)) << c.what;
+    if (c.shut_write) ::shutdown(fd.get(), SHUT_WR);
+    const Json::Value answer = ReadAnswer(fd.get());
+    EXPECT_FALSE(answer["success"].asBool()) << c.what << ": " << toString(answer);
+    EXPECT_EQ(c.code, answer["error"]["code"].asInt()) << c.what << ": " << toString(answer);
+    EXPECT_FALSE(answer["error"]["msg"].asString().empty()) << c.what;
+    StillServing();
+  }
+  // After a bad request (not a bad frame) the same connection serves on.
+  FileDescriptor fd = ConnectRaw(SocketPath());
+  ASSERT_TRUE(SendBytes(fd.get(), Framed("{oops")));
+  EXPECT_EQ(search::kBadJson, ReadAnswer(fd.get())["error"]["code"].asInt());
+  ASSERT_TRUE(SendBytes(fd.get(), Framed(toString(Command("commit", kId)))));
+  EXPECT_TRUE(ReadAnswer(fd.get())["success"].asBool());
+}
+
+TEST_F(KaloelasticdTest, SilentAndHalfSentClientsHoldUpNobody) {
+  Start();
+  CreateIndex();
+  FileDescriptor silent = ConnectRaw(SocketPath());
+  FileDescriptor half = ConnectRaw(SocketPath());
+  ASSERT_TRUE(SendBytes(half.get(), LengthWord(1000) + "{\"command\": "));
+  std::vector<FileDescriptor> crowd;
+  for (int i = 0; i < 50; ++i) crowd.push_back(ConnectRaw(SocketPath()));
+  Ok(Upsert(kId, FileDoc("/v/s/meanwhile")));
+  Ok(Command("commit", kId));
+  StillServing();
+}
+
+TEST_F(KaloelasticdTest, SigtermFinishesTheAnswerBeingWritten) {
+  Start();
+  CreateIndex();
+  Json::Value compound;
+  for (int i = 0; i < 4000; ++i) {
+    Json::Value doc = FileDoc("/v/s/dir/file-" + std::to_string(i));
+    doc["KALOMDTitle"] = std::string(500, 'x');
+    compound["compound"].append(Upsert(kId, doc));
+  }
+  Ok(compound);
+  // An answer of about 2 MB, far more than the socket holds: the daemon is
+  // still writing it when the signal comes.
+  FileDescriptor fd = ConnectRaw(SocketPath());
+  ASSERT_TRUE(
+      SendBytes(fd.get(), Framed(toString(PrefixQuery("document_get_by_query", kId, "/v/s/")))));
+  struct pollfd p = {fd.get(), POLLIN, 0};
+  ASSERT_EQ(1, ::poll(&p, 1, 10000));
+  const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
+  ASSERT_GE(pidfd, 0);
+  ASSERT_EQ(0, ::kill(pid_, SIGTERM));
+  const Json::Value answer = ReadAnswer(fd.get());
+  EXPECT_TRUE(answer["success"].asBool());
+  EXPECT_EQ(4000u, answer["data"].size());
+  struct pollfd gone = {pidfd, POLLIN, 0};
+  EXPECT_EQ(1, ::poll(&gone, 1, 10000));
+  ::close(pidfd);
+  pid_ = -1;
+  EXPECT_FALSE(std::filesystem::exists(SocketPath()));
+}
+
+TEST_F(KaloelasticdTest, TheToolSearchesAndShowsStats) {
+  const std::string orvex = std::string(ORVEX_BUILD_DIR) + "/orvex";
+  auto tool = [&](const std::vector<std::string>& args) {
+    return RunProgram(orvex, args, {"ORVEX_ROOT=" + root_.path()}, io_.path());
+  };
+  ProgramOutcome run = tool({"stats"});
+  EXPECT_EQ(2, run.status);
+  EXPECT_NE(std::string::npos, run.err.find("error 913")) << run.err;
+  Start();
+  CreateIndex();
+  Json::Value doc = FileDoc("/v/s/Straße.txt", 42);
+  doc["KALOMDTextContent"] = "a wonderful day";
+  Ok(Upsert(kId, doc));
+  Ok(Upsert(kId, FileDoc("/v/s/other.txt")));
+  Ok(Command("commit", kId));
+  run = tool({"search", "STRASSE"});
+  EXPECT_EQ(0, run.status) << run.err;
+  EXPECT_EQ("document\t42\t/v/s/Straße.txt\n1 of 1 hits\n", run.out);
+  run = tool({"search", "--text", "wonder*", "--json"});
+  EXPECT_EQ(0, run.status) << run.err;
+  EXPECT_EQ("a [wonderful] day", ParseJson(run.out)["hits"][0]["snippet"].asString());
+  run = tool({"stats"});
+  EXPECT_EQ(0, run.status) << run.err;
+  EXPECT_EQ("fileindex_s\t2 documents\t", run.out.substr(0, 24)) << run.out;
+  run = tool({"search", "--sort", "colour"});
+  EXPECT_EQ(2, run.status);
+  EXPECT_NE(std::string::npos, run.err.find("error 1103")) << run.err;
+}
+
+}  // namespace
+}  // namespace testing
+}  // namespace orvex

@@ -1,0 +1,390 @@
+// The search daemon's commands, each sent over the real socket to the engine
+// and loop running in this process.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <random>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "search/case_fold.h"
+#include "search/search_error.h"
+#include "searchd/searchd_fixture.h"
+
+namespace orvex {
+namespace testing {
+namespace {
+
+using search::SearchCode;
+
+class SearchEngineTest : public SearchdLoopTest {
+ protected:
+  void SetUp() override { CreateIndex(); }
+
+  void Commit() { Ok(Command("commit", kId)); }
+
+  Json::Value GetByPrefix(const std::string& prefix) {
+    return Ok(PrefixQuery("document_get_by_query", kId, prefix));
+  }
+};
+
+TEST_F(SearchEngineTest, UpsertThenSetKeepsThePropertiesNotSet) {
+  Json::Value doc = FileDoc("/v/s/song.mp3", 4000);
+  doc["KALOMDTitle"] = "Blue in Green";
+  doc["KALOMDDurationSecond"] = 337.5;
+  doc["KALOMDTextContent"] = "so what freddie freeloader";
+  Ok(Upsert(kId, doc));
+  Json::Value attrs;
+  attrs["KALOMDFSSize"] = 4096;
+  attrs["KALOMDFSContentChangeDate"] = 1800000000;
+  Ok(SetById(kId, "/v/s/song.mp3", attrs));
+  Commit();
+
+  const Json::Value docs = GetByPrefix("/v/s/")["data"];
+  ASSERT_EQ(1u, docs.size());
+  EXPECT_EQ("Blue in Green", docs[0]["KALOMDTitle"].asString());
+  EXPECT_EQ(337.5, docs[0]["KALOMDDurationSecond"].asDouble());
+  EXPECT_EQ(4096, docs[0]["KALOMDFSSize"].asInt());
+  EXPECT_EQ(1800000000, docs[0]["KALOMDFSContentChangeDate"].asInt());
+  // The text content survives the set too: a text search still finds it.
+  Json::Value text;
+  text["text"] = "freeloader";
+  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"}, HitPaths(SearchFor(text)));
+  Json::Value size;
+  size["size_min"] = 4096;
+  size["size_max"] = 4096;
+  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"}, HitPaths(SearchFor(size)));
+}
+
+TEST_F(SearchEngineTest, SetOfAMissingDocumentIsAnError) {
+  Json::Value attrs;
+  attrs["KALOMDFSSize"] = 1;
+  EXPECT_EQ(search::kNoSuchDocument, ErrorCode(SetById(kId, "/v/s/never", attrs)));
+}
+
+TEST_F(SearchEngineTest, DeleteByPrefixLeavesTheDirectoryAndItsLookalikeSiblings) {
+  for (const char* path :
+       {"/v/s/a", "/v/s/a/x", "/v/s/a/y/z", "/v/s/ab", "/v/s/ab/c", "/v/s/a.txt", "/v/s/b"}) {
+    Ok(Upsert(kId, FileDoc(path)));
+  }
+  const Json::Value answer = Ok(PrefixQuery("document_del_by_query", kId, "/v/s/a/"));
+  EXPECT_EQ(2, answer["data"]["deleted"].asInt());
+  Commit();
+  EXPECT_EQ((std::vector<std::string>{"/v/s/a", "/v/s/a.txt", "/v/s/ab", "/v/s/ab/c", "/v/s/b"}),
+            DocPaths(GetByPrefix("/v/s/")));
+}
+
+TEST_F(SearchEngineTest, DeleteByIdRemovesOneDocument) {
+  Ok(Upsert(kId, FileDoc("/v/s/a")));
+  Ok(Upsert(kId, FileDoc("/v/s/b")));
+  Json::Value del = Command("document_del_by_id", kId);
+  del["data"]["doc_id"] = "/v/s/a";
+  EXPECT_EQ(1, Ok(del)["data"]["deleted"].asInt());
+  EXPECT_EQ(0, Ok(del)["data"]["deleted"].asInt());  // again: nothing left, still fine
+  Commit();
+  EXPECT_EQ(std::vector<std::string>{"/v/s/b"}, DocPaths(GetByPrefix("/v/s/")));
+  EXPECT_EQ(std::vector<std::string>{"/v/s/b"}, HitPaths(SearchName("")));
+}
+
+TEST_F(SearchEngineTest, NothingIsVisibleToASearchBeforeCommit) {
+  Ok(Upsert(kId, FileDoc("/v/s/report.pdf")));
+  EXPECT_EQ(0, SearchName("report")["data"]["total"].asInt());
+  // The indexer's own query sees its uncommitted writes (a rename needs them).
+  EXPECT_EQ(std::vector<std::string>{"/v/s/report.pdf"}, DocPaths(GetByPrefix("/v/s/")));
+  Commit();
+  EXPECT_EQ(std::vector<std::string>{"/v/s/report.pdf"}, HitPaths(SearchName("report")));
+  Json::Value del = Command("document_del_by_id", kId);
+  del["data"]["doc_id"] = "/v/s/report.pdf";
+  Ok(del);
+  EXPECT_EQ(1, SearchName("report")["data"]["total"].asInt());
+  Commit();
+  EXPECT_EQ(0, SearchName("report")["data"]["total"].asInt());
+}
+
+TEST_F(SearchEngineTest, ACompoundAnswersEachSubRequestAndMarksTheFailure) {
+  Json::Value compound;
+  compound["compound"].append(Upsert(kId, FileDoc("/v/s/one")));
+  compound["compound"].append(SetById(kId, "/v/s/missing", FileDoc("/v/s/missing")));
+  Json::Value bad_type = FileDoc("/v/s/three");
+  bad_type["KALOMDFSSize"] = "big";
+  compound["compound"].append(Upsert(kId, bad_type));
+  compound["compound"].append(Upsert(kId, FileDoc("/v/s/four")));
+  const Json::Value answer = Ok(compound);
+  EXPECT_TRUE(answer["has_fail"].asBool());
+  ASSERT_EQ(4u, answer["data"].size());
+  EXPECT_TRUE(answer["data"][0]["success"].asBool());
+  EXPECT_EQ(search::kNoSuchDocument, answer["data"][1]["error"]["code"].asInt());
+  EXPECT_EQ(search::kBadArgument, answer["data"][2]["error"]["code"].asInt());
+  EXPECT_TRUE(answer["data"][3]["success"].asBool());
+  EXPECT_EQ((std::vector<std::string>{"/v/s/four", "/v/s/one"}), DocPaths(GetByPrefix("/v/s/")));
+
+  Json::Value clean;
+  clean["compound"] = Json::Value(Json::arrayValue);
+  const Json::Value empty = Ok(clean);
+  EXPECT_FALSE(empty["has_fail"].asBool());
+  EXPECT_EQ(0u, empty["data"].size());
+}
+
+TEST_F(SearchEngineTest, SetWithANewPathMovesTheDocument) {
+  Ok(Upsert(kId, FileDoc("/v/s/old/a.txt")));
+  Json::Value moved;
+  moved["KALOMDPath"] = "/v/s/new/a.txt";
+  moved["KALOMDParent"] = "/v/s/new";
+  Ok(SetById(kId, "/v/s/old/a.txt", moved));
+  Commit();
+  EXPECT_EQ(std::vector<std::string>{"/v/s/new/a.txt"}, DocPaths(GetByPrefix("/v/s/")));
+  Json::Value folder;
+  folder["folder"] = "/v/s/new";
+  EXPECT_EQ(std::vector<std::string>{"/v/s/new/a.txt"}, HitPaths(SearchFor(folder)));
+  folder["folder"] = "/v/s/old";
+  EXPECT_EQ(0, SearchFor(folder)["data"]["total"].asInt());
+}
+
+// Every length of fragment, in any case, against a naive scan of the same
+// generated names: short fragments take the scan path, longer ones the
+// trigram index, and both must agree with the model exactly.
+TEST_F(SearchEngineTest, NameFragmentsMatchANaiveScan) {
+  const std::vector<std::string> pieces = {"a",    "B", "ab",  "Straße", "STRASSE", "é",
+                                           "É",    "x", "Ünï", "ünï",    "photo",   "PHOTO",
+                                           "2024", "_", ".",   "ǅ"};
+  std::mt19937 random(20241124);
+  std::vector<std::string> names;
+  Json::Value compound;
+  for (int i = 0; i < 400; ++i) {
+    std::string name;
+    const int parts = 1 + static_cast<int>(random() % 5);
+    for (int p = 0; p < parts; ++p) name += pieces[random() % pieces.size()];
+    name += "-" + std::to_string(i);
+    names.push_back(name);
+    compound["compound"].append(Upsert(kId, FileDoc("/v/s/" + name)));
+  }
+  // One fixed name, so the ten-character fragment below has a match.
+  names.push_back("xxSTRASSEab-1yy");
+  compound["compound"].append(Upsert(kId, FileDoc("/v/s/" + names.back())));
+  EXPECT_FALSE(Ok(compound)["has_fail"].asBool());
+  Commit();
+  const std::vector<std::string> fragments = {
+      "a",   "É",   "ß",  "ab",        "Ab",           "x.",  "ss", "ünï", "STR",
+      "raß", "PHO", "5-", "photo2024", "strassephoto", "aÉa", "ǆ",  "-1",  "Straßeab-1"};
+  for (const std::string& fragment : fragments) {
+    const std::string folded = search::FoldCase(fragment);
+    std::set<std::string> expected;
+    for (const std::string& name : names) {
+      if (search::FoldCase(name).find(folded) != std::string::npos) expected.insert("/v/s/" + name);
+    }
+    const Json::Value answer = SearchName(fragment);
+    const std::vector<std::string> got = HitPaths(answer);
+    EXPECT_EQ(expected, std::set<std::string>(got.begin(), got.end())) << "fragment " << fragment;
+    EXPECT_EQ(static_cast<int64_t>(expected.size()), answer["data"]["total"].asInt64())
+        << "fragment " << fragment;
+  }
+  const std::vector<std::string> ten = HitPaths(SearchName("Straßeab-1"));
+  EXPECT_NE(ten.end(), std::find(ten.begin(), ten.end(), "/v/s/xxSTRASSEab-1yy"));
+}
+
+// Many matches take the other way to the first page (the name index read in
+// order); both directions and an offset must still give the model's page.
+TEST_F(SearchEngineTest, CommonFragmentsPageInNameOrderLikeTheModel) {
+  std::mt19937 random(7);
+  std::vector<std::pair<std::string, std::string>> model;  // folded name, path
+  Json::Value compound;
+  for (int i = 0; i < 1500; ++i) {
+    std::string name = std::string(1, static_cast<char>('A' + random() % 26)) + "x" +
+                       std::to_string(random() % 100) + (i % 3 ? "Photo" : "PHOTO") + ".jpg";
+    const std::string path = "/v/s/d" + std::to_string(i) + "/" + name;
+    model.emplace_back(search::FoldCase(name), path);
+    compound["compound"].append(Upsert(kId, FileDoc(path)));
+  }
+  Ok(compound);
+  Commit();
+  std::sort(model.begin(), model.end());
+  for (const bool descending : {false, true}) {
+    if (descending) std::reverse(model.begin(), model.end());
+    std::vector<std::string> expected;
+    for (size_t i = 10; i < 60; ++i) expected.push_back(model[i].second);
+    Json::Value q;
+    q["name"] = "pHoTo";
+    q["offset"] = 10;
+    q["limit"] = 50;
+    if (descending) q["order"] = "desc";
+    const Json::Value answer = SearchFor(q);
+    EXPECT_EQ(1500, answer["data"]["total"].asInt()) << "descending " << descending;
+    EXPECT_EQ(expected, HitPaths(answer)) << "descending " << descending;
+  }
+}
+
+TEST_F(SearchEngineTest, SearchFiltersSortsAndPages) {
+  Json::Value compound;
+  for (int i = 0; i < 30; ++i) {
+    const std::string ext = i % 3 == 0 ? "jpg" : i % 3 == 1 ? "pdf" : "mp3";
+    compound["compound"].append(Upsert(
+        kId, FileDoc("/v/s/d" + std::to_string(i % 2) + "/f" + std::to_string(100 + i) + "." + ext,
+                     i * 10)));
+  }
+  Ok(compound);
+  Commit();
+  Json::Value q;
+  q["type"] = "image";
+  q["sort"] = "size";
+  q["order"] = "desc";
+  q["limit"] = 3;
+  q["offset"] = 1;
+  Json::Value answer = SearchFor(q);
+  EXPECT_EQ(10, answer["data"]["total"].asInt());
+  EXPECT_EQ((std::vector<std::string>{"/v/s/d0/f124.jpg", "/v/s/d1/f121.jpg", "/v/s/d0/f118.jpg"}),
+            HitPaths(answer));
+  Json::Value ext;
+  ext["extension"] = "PDF";
+  ext["folder"] = "/v/s/d1";
+  ext["size_max"] = 100;
+  EXPECT_EQ((std::vector<std::string>{"/v/s/d1/f101.pdf", "/v/s/d1/f107.pdf"}),
+            HitPaths(SearchFor(ext)));
+}
+
+TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
+  Json::Value a = FileDoc("/v/s/a.txt");
+  a["KALOMDTextContent"] = "The quick brown fox jumps over the lazy dog";
+  Json::Value b = FileDoc("/v/s/b.txt");
+  b["KALOMDTextContent"] = "A brown dog, quick to anger; café au lait";
+  Json::Value c = FileDoc("/v/s/c.txt");
+  c["KALOMDTitle"] = "Quickstart guide";
+  Ok(Upsert(kId, a));
+  Ok(Upsert(kId, b));
+  Ok(Upsert(kId, c));
+  Commit();
+  const struct {
+    const char* query;
+    std::vector<std::string> paths;
+  } cases[] = {
+      {"quick", {"/v/s/a.txt", "/v/s/b.txt"}},
+      {"\"quick brown\"", {"/v/s/a.txt"}},
+      {"quick*", {"/v/s/a.txt", "/v/s/b.txt", "/v/s/c.txt"}},
+      {"dog brown", {"/v/s/a.txt", "/v/s/b.txt"}},
+      {"cafe", {"/v/s/b.txt"}},  // diacritics removed
+      {"NEAR(fox dog)", {}},     // user text is never FTS5 syntax
+      {"guide", {"/v/s/c.txt"}},
+  };
+  for (const auto& c_ : cases) {
+    Json::Value q;
+    q["text"] = c_.query;
+    const Json::Value answer = SearchFor(q);
+    EXPECT_EQ(c_.paths, HitPaths(answer)) << c_.query;
+  }
+  Json::Value q;
+  q["text"] = "lazy";
+  EXPECT_EQ("The quick brown fox jumps over the [lazy] dog",
+            SearchFor(q)["data"]["hits"][0]["snippet"].asString());
+}
+
+TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
+  Json::Value no_doc_id = Command("document_upsert_by_id", kId);
+  no_doc_id["data"]["data"] = FileDoc("/v/s/x");
+  Json::Value doc_not_object = Upsert(kId, FileDoc("/v/s/x"));
+  doc_not_object["data"]["data"] = "text";
+  Json::Value size_as_text = Upsert(kId, FileDoc("/v/s/x"));
+  size_as_text["data"]["data"]["KALOMDFSSize"] = "ten";
+  Json::Value empty_prefix = PrefixQuery("document_del_by_query", kId, "");
+  Json::Value bad_query = Command("document_get_by_query", kId);
+  bad_query["data"]["query"]["qsl"]["match"]["KALOMDPath"] = "/v";
+  Json::Value no_data;
+  no_data["command"] = "commit";
+  Json::Value relative = Command("index_create", "fileindex_t");
+  relative["data"]["path"] = "relative/db";
+  Json::Value other_path = Command("index_create", kId);
+  other_path["data"]["path"] = DbPath("elsewhere");
+  Json::Value bad_sort;
+  bad_sort["command"] = "search";
+  bad_sort["data"]["sort"] = "colour";
+  const struct {
+    const char* what;
+    Json::Value request;
+    int code;
+  } cases[] = {
+      {"unknown command", Command("index_explode", kId), search::kUnknownCommand},
+      {"command not a string", ParseJson(R"({"command": 7, "data": {}})"), search::kBadArgument},
+      {"no command", ParseJson(R"({"data": {"id": "x"}})"), search::kBadArgument},
+      {"no data", no_data, search::kBadArgument},
+      {"not an object", ParseJson(R"([1, 2])"), search::kBadJson},
+      {"id with ..", Command("commit", "fileindex_.."), search::kBadIndexId},
+      {"id with /", Command("commit", "fileindex_a/b"), search::kBadIndexId},
+      {"empty id", Command("commit", ""), search::kBadIndexId},
+      {"id not a string", ParseJson(R"({"command": "commit", "data": {"id": 3}})"),
+       search::kBadArgument},
+      {"unknown index", Command("commit", "fileindex_none"), search::kNoSuchIndex},
+      {"no doc_id", no_doc_id, search::kBadArgument},
+      {"document not an object", doc_not_object, search::kBadArgument},
+      {"size as text", size_as_text, search::kBadArgument},
+      {"empty prefix", empty_prefix, search::kBadArgument},
+      {"query not a prefix", bad_query, search::kBadArgument},
+      {"relative path", relative, search::kBadArgument},
+      {"existing id elsewhere", other_path, search::kIndexExists},
+      {"unknown sort", bad_sort, search::kBadArgument},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(c.code, ErrorCode(c.request)) << c.what << ": " << toString(c.request);
+  }
+  // The index is still there and serving.
+  Ok(Upsert(kId, FileDoc("/v/s/after")));
+}
+
+TEST_F(SearchEngineTest, PauseResumeAndStatsSurviveARestart) {
+  Ok(Upsert(kId, FileDoc("/v/s/kept")));
+  Commit();
+  Ok(Upsert(kId, FileDoc("/v/s/dropped")));  // never committed
+  Ok(Command("index_pause", kId));
+  Restart();
+  Json::Value stats;
+  stats["command"] = "stats";
+  stats["data"] = Json::Value(Json::objectValue);
+  Json::Value answer = Ok(stats);
+  ASSERT_EQ(1u, answer["data"]["indexes"].size());
+  EXPECT_EQ(kId, answer["data"]["indexes"][0]["id"].asString());
+  EXPECT_TRUE(answer["data"]["indexes"][0]["paused"].asBool());
+  EXPECT_EQ(1, answer["data"]["indexes"][0]["documents"].asInt());
+  EXPECT_EQ(std::vector<std::string>{"/v/s/kept"}, HitPaths(SearchName("")));
+  Ok(Command("index_resume", kId));
+  EXPECT_FALSE(Ok(stats)["data"]["indexes"][0]["paused"].asBool());
+}
+
+TEST_F(SearchEngineTest, ConfigSetRenamesAndMovesTheDatabaseWhole) {
+  Ok(Upsert(kId, FileDoc("/v/s/a")));
+  Commit();
+  Ok(Upsert(kId, FileDoc("/v/s/b")));  // committed by the move
+  Json::Value rename = Command("index_config_set", kId);
+  rename["data"]["data"]["id"] = "fileindex_t";
+  rename["data"]["data"]["path"] = DbPath("t");
+  Ok(rename);
+  EXPECT_FALSE(std::filesystem::exists(DbPath("s")));
+  EXPECT_TRUE(std::filesystem::exists(DbPath("t")));
+  EXPECT_EQ(search::kNoSuchIndex, ErrorCode(Command("commit", kId)));
+  Restart();
+  EXPECT_EQ((std::vector<std::string>{"/v/s/a", "/v/s/b"}),
+            DocPaths(Ok(PrefixQuery("document_get_by_query", "fileindex_t", "/v/s/"))));
+  Json::Value migrate = Command("index_config_set", "fileindex_t");
+  migrate["data"]["data"]["path"] = DbPath("u");
+  Ok(migrate);
+  EXPECT_FALSE(std::filesystem::exists(DbPath("t")));
+  EXPECT_EQ(2, SearchName("")["data"]["total"].asInt());
+  // Taking an existing index's id is refused.
+  CreateIndex("fileindex_v", "v");
+  Json::Value clash = Command("index_config_set", "fileindex_v");
+  clash["data"]["data"]["id"] = "fileindex_t";
+  EXPECT_EQ(search::kIndexExists, ErrorCode(clash));
+}
+
+TEST_F(SearchEngineTest, DeleteRemovesTheIndexAndItsDatabase) {
+  Ok(Upsert(kId, FileDoc("/v/s/a")));
+  Commit();
+  Ok(Command("index_delete", kId));
+  EXPECT_FALSE(std::filesystem::exists(DbPath("s")));
+  EXPECT_EQ(search::kNoSuchIndex, ErrorCode(Upsert(kId, FileDoc("/v/s/a"))));
+  Ok(Command("index_delete", kId));  // again: already gone, not an error
+  Restart();
+  EXPECT_EQ(search::kNoSuchIndex, ErrorCode(Command("commit", kId)));
+}
+
+}  // namespace
+}  // namespace testing
+}  // namespace orvex
