@@ -132,16 +132,6 @@ std::string StoredQueue(const std::string& path) {
   return value["queue"].isString() ? value["queue"].asString() : "";
 }
 
-bool MakeDirs(const std::string& dir) {
-  for (size_t slash = dir.find('/', 1);; slash = dir.find('/', slash + 1)) {
-    const std::string part = dir.substr(0, slash);
-    if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) return false;
-    if (slash == std::string::npos) break;
-  }
-  errno = 0;
-  return true;
-}
-
 bool Refuse(int error, const char* call, const std::string& why) {
   KALO_LOG(LOG_ERR, "MonitorQueue::%s failed: %s", call, why.c_str());
   errno = error;
@@ -188,7 +178,8 @@ bool MonitorQueue::Upsert(const MonitorQueue& queue, const std::string& app_name
   if (!Normalise(queue.description(), stored, why)) return Refuse(EINVAL, "Upsert", why);
   std::string path;
   if (!RegistrationFile("Upsert", stored["queue"].asString(), app_name, type, path)) return false;
-  if (!MakeDirs(AppDir(app_name)) || !orvex::portable::WriteFileAtomic(path, Text(stored))) {
+  if (!orvex::portable::MakeDirectories(AppDir(app_name)) ||
+      !orvex::portable::WriteFileAtomic(path, Text(stored))) {
     const int error = errno;
     return Refuse(error, "Upsert", path + ": " + std::strerror(error));
   }

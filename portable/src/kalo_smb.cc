@@ -42,13 +42,6 @@ bool LoadSettings(const std::string& path, Json::Value& settings) {
   return true;
 }
 
-void MakeDirs(const std::string& path) {
-  for (size_t slash = path.find('/', 1); slash != std::string::npos;
-       slash = path.find('/', slash + 1)) {
-    ::mkdir(path.substr(0, slash).c_str(), 0755);
-  }
-}
-
 }  // namespace
 
 int KALOSMBIsEnableSpotlight() {
@@ -76,7 +69,8 @@ int KALOSMBSetSpotlight(int on) {
   settings[kSpotlightKey] = on != 0;
   Json::StreamWriterBuilder writer;
   writer["indentation"] = "  ";
-  MakeDirs(path);
+  // A fresh root has no /etc/orvex yet; a failure shows in the write below.
+  orvex::portable::MakeDirectories(path.substr(0, path.rfind('/')));
   if (!orvex::portable::WriteFileAtomic(path, Json::writeString(writer, settings) + "\n")) {
     KALO_LOG(LOG_ERR, "cannot write %s: %s", path.c_str(), std::strerror(errno));
     KLIBC_ERR_SET(KLIB_ERR_IO);

@@ -22,6 +22,7 @@
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/util.h"
 #include "orvex/portable/atomic_file.h"
+#include "orvex/portable/daemon_process.h"
 #include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
 #include "orvex/version.h"
@@ -92,43 +93,6 @@ Options ParseArgs(int argc, char** argv) {
   return opt;
 }
 
-// SIGTERM and SIGINT arrive through a descriptor the step waits on, so a stop
-// is seen at once and never between a check and a wait.
-orvex::FileDescriptor StopSignals() {
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGTERM);
-  sigaddset(&stop, SIGINT);
-  ::sigprocmask(SIG_BLOCK, &stop, nullptr);
-  ::signal(SIGPIPE, SIG_IGN);
-  return orvex::FileDescriptor(::signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK));
-}
-
-// Detaches: the parent returns once the child says it watches (one byte on
-// the pipe) or has failed (the pipe closes empty), so that whoever started
-// the daemon may change files as soon as the command returns.
-int Detach(orvex::FileDescriptor& ready) {
-  int fds[2];
-  if (::pipe2(fds, O_CLOEXEC) != 0) return kExitFailure;
-  orvex::FileDescriptor read_end(fds[0]);
-  ready.reset(fds[1]);
-  const pid_t pid = ::fork();
-  if (pid < 0) return kExitFailure;
-  if (pid > 0) {
-    ready.reset();
-    char byte = 0;
-    ssize_t n;
-    while ((n = ::read(read_end.get(), &byte, 1)) < 0 && errno == EINTR) {
-    }
-    return n == 1 ? 0 : kExitFailure;
-  }
-  ::setsid();
-  if (::chdir("/") != 0) return kExitFailure;
-  const orvex::FileDescriptor null(::open("/dev/null", O_RDWR | O_CLOEXEC));
-  for (int fd = 0; fd <= 2; ++fd) ::dup2(null.get(), fd);
-  return -1;  // in the daemon: go on
-}
-
 void WriteStatus(const orvex::watch::Watcher& watcher, bool running) {
   Json::Value status = watcher.Status();
   status["pid"] = static_cast<Json::Int>(::getpid());
@@ -145,12 +109,10 @@ void WriteStatus(const orvex::watch::Watcher& watcher, bool running) {
 
 int Serve(const Options& opt) {
   orvex::FileDescriptor ready;
-  if (!opt.foreground) {
-    const int status = Detach(ready);
-    if (status >= 0) return status;
-  }
+  const int started = orvex::portable::DetachUnlessForeground(opt.foreground, ready);
+  if (started >= 0) return started;  // the starter, told how the start went
   ::openlog(kIdent, LOG_PID, LOG_DAEMON);
-  orvex::FileDescriptor stop = StopSignals();
+  orvex::FileDescriptor stop = orvex::portable::BlockStopSignals();
   orvex::watch::WatcherOptions options;
   options.registry_dir = RootPath(KALO::KALONOTIFYD::kMonitorRegistryDir);
   orvex::watch::Watcher watcher(options);
@@ -163,12 +125,7 @@ int Serve(const Options& opt) {
   }
   watcher.set_wake_fd(stop.get());
   const std::string pid_path = RootPath(KALO::KALONOTIFYD::kNotifyPidPath);
-  if (!opt.foreground) {
-    orvex::MakeParentDirectories(pid_path);
-    orvex::portable::WriteFileAtomic(pid_path, std::to_string(::getpid()) + "\n");
-    if (::write(ready.get(), "r", 1) != 1) return kExitFailure;
-    ready.reset();
-  }
+  if (!orvex::portable::AnnounceReady(ready, pid_path)) return kExitFailure;
   syslog(LOG_INFO, "watching %zu directories for %s", watcher.watch_count(),
          options.registry_dir.c_str());
   WriteStatus(watcher, /*running=*/true);

@@ -22,6 +22,12 @@ namespace portable {
 // is written: a save never replaces a link with a plain file.
 bool WriteFileAtomic(const std::string& path, const std::string& data, mode_t mode = 0644);
 
+// Creates dir and the directories above it that are missing (mode 0755, as
+// "mkdir -p"), so that a file can be written under a fresh ORVEX_ROOT.
+// Returns true when dir exists as a directory afterwards; false with errno
+// set otherwise.
+bool MakeDirectories(const std::string& dir);
+
 // Reads the whole file into data. Returns false with errno set on failure;
 // a directory fails with EISDIR.
 bool ReadWholeFile(const std::string& path, std::string& data);

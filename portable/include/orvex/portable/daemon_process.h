@@ -1,0 +1,39 @@
+// What every daemon of the system does around its loop: take SIGTERM and
+// SIGINT as a descriptor its loop waits on, detach from whoever started it
+// once it is ready to serve, and keep a pid file. One thread at a time: these
+// change process-wide state (the signal mask, the session, descriptors 0-2).
+#ifndef ORVEX_PORTABLE_DAEMON_PROCESS_H_
+#define ORVEX_PORTABLE_DAEMON_PROCESS_H_
+
+#include <string>
+
+#include "orvex/portable/file_descriptor.h"
+
+namespace orvex {
+namespace portable {
+
+// Blocks SIGTERM and SIGINT and returns a non-blocking signalfd that becomes
+// readable when one arrives, so a stop is seen at once and never between a
+// check and a wait. SIGPIPE is ignored: a peer that goes away fails a write
+// instead of killing the daemon. An invalid descriptor (errno set) when the
+// signalfd cannot be made.
+FileDescriptor BlockStopSignals();
+
+// Unless foreground, forks. The starting process waits until the daemon says
+// it is ready (AnnounceReady) or fails before that, and returns the exit
+// status it should end with: 0 when ready, 1 otherwise, so that whoever
+// started the daemon can use it as soon as the command returns. The daemon
+// process (and a foreground run) gets -1 and goes on: it has left the
+// terminal's session, its working directory is "/" and descriptors 0-2 are
+// /dev/null; ready holds the descriptor that AnnounceReady writes to.
+int DetachUnlessForeground(bool foreground, FileDescriptor& ready);
+
+// Writes pid_path (creating its directory) and tells the waiting starter
+// that the daemon serves. Nothing to do for a foreground run (ready is
+// invalid). False with errno set when the starter could not be told.
+bool AnnounceReady(FileDescriptor& ready, const std::string& pid_path);
+
+}  // namespace portable
+}  // namespace orvex
+
+#endif  // ORVEX_PORTABLE_DAEMON_PROCESS_H_
