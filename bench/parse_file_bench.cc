@@ -50,6 +50,7 @@
 #include "bench_timing.h"
 #include "content_extractor.h"
 #include "extract_service.h"
+#include "extract_worker.h"
 #include "kalo/kalo_content_extract.h"
 #include "orvex/portable/extract_protocol.h"
 #include "orvex/portable/root.h"
@@ -678,21 +679,24 @@ DaemonFigures DaemonPath(const Corpus& corpus, const std::string& program) {
   return figures;
 }
 
-// The parsers in this process, with the worker's answer object built and
-// its JSON text written and read back: what the isolated path adds before
-// any process boundary.
+// The parsers in this process, with the worker's answer message built (its
+// JSON text, the text behind it) and read back as the caller reads it: what
+// the isolated path adds before any process boundary.
 bool WithAnswerText(const std::string& path, Json::Value& doc) {
-  const Json::Value answer = orvex::portable::ExtractInWorker(
+  const std::string message = orvex::portable::AnswerMessage(orvex::portable::ExtractInWorker(
       path, [](const std::string& p, Json::Value& out, std::string* problem) {
         return orvex::extract::ExtractMetadata(p, orvex::extract::ExtractLimits(), out, problem);
-      });
-  Json::StreamWriterBuilder writer;
-  writer["indentation"] = "";
-  const std::string text = Json::writeString(writer, answer);
+      }));
+  const size_t nul = std::min(message.find('\0'), message.size());
   Json::CharReaderBuilder reader;
   std::string errors;
   const std::unique_ptr<Json::CharReader> parser(reader.newCharReader());
-  return parser->parse(text.data(), text.data() + text.size(), &doc, &errors);
+  if (!parser->parse(message.data(), message.data() + nul, &doc, &errors)) return false;
+  if (nul < message.size()) {
+    doc["data"][orvex::portable::kExtractTextMember] =
+        Json::Value(message.data() + nul + 1, message.data() + message.size());
+  }
+  return true;
 }
 
 bool ExtractionFigures(const std::string& corpus_dir, const std::string& program) {
@@ -704,7 +708,7 @@ bool ExtractionFigures(const std::string& corpus_dir, const std::string& program
   const double answer = TimeCorpus(corpus, WithAnswerText, answer_tally);
   PrintRate("with metadata, ParseFile through kalocontentextractd", corpus, isolated.seconds);
   PrintRate("with metadata, parsers in process", corpus, local);
-  PrintRate("parsers in process, answer JSON written and read (no process boundary)", corpus,
+  PrintRate("parsers in process, answer message written and read (no process boundary)", corpus,
             answer);
   PrintKinds(corpus, isolated.tally, local_tally);
   bool pass = isolated.workers_pass;

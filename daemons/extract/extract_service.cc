@@ -19,6 +19,7 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <memory>
 #include <sstream>
 #include <string>
 #include <utility>
@@ -32,21 +33,51 @@ namespace {
 
 constexpr size_t kReadChunk = 64 * 1024;
 constexpr int kAcceptsPerRound = 16;
+constexpr int kReadsPerRound = 64;
+// Room for a long text in the sockets that carry answers (the worker's end
+// of its channel, the daemon's end of each client's connection), so that
+// most answers cross in one write rather than a buffer's worth per wake-up.
+// The kernel charges it only while bytes are in flight.
+constexpr int kAnswerSocketBuffer = 1 << 20;
+constexpr size_t kRecycledBufferBytes = 4u << 20;
 // A worker's answer carries at most the parsers' text limit and the
 // properties: far below this. More means the worker is not ours any more.
 constexpr uint32_t kMaxAnswerBytes = 64u << 20;
 
 std::string JsonText(const Json::Value& value) {
-  Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
-  return Json::writeString(builder, value);
+  // Made once per thread, as the reader.
+  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = true;
+    return builder.newStreamWriter();
+  }());
+  std::ostringstream out;
+  writer->write(value, &out);
+  return out.str();
+}
+
+bool ParseJson(const char* begin, const char* end, Json::Value& value) {
+  // Made once per thread: a reader's settings cost more to build than a
+  // small message costs to parse.
+  thread_local const std::unique_ptr<Json::CharReader> reader(
+      Json::CharReaderBuilder().newCharReader());
+  std::string errors;
+  return reader->parse(begin, end, &value, &errors);
 }
 
 bool ParseJson(const std::string& text, Json::Value& value) {
-  Json::CharReaderBuilder builder;
-  std::string errors;
-  std::istringstream in(text);
-  return Json::parseFromStream(builder, in, &value, &errors);
+  return ParseJson(text.data(), text.data() + text.size(), value);
+}
+
+// True when what follows a worker's JSON header (from header_end to end) is
+// what the header announces: the NUL and "text_bytes" bytes of text, or
+// nothing.
+bool TextFits(const Json::Value& header, const char* header_end, const char* end) {
+  if (!header.isMember("text_bytes")) return header_end == end;
+  const Json::Value& bytes = header["text_bytes"];
+  return bytes.isUInt64() && header_end < end &&
+         static_cast<Json::UInt64>(end - header_end - 1) == bytes.asUInt64();
 }
 
 Json::Value Failure(const std::string& reason, const char* fault = nullptr) {
@@ -71,10 +102,11 @@ Json::Value FaultOf(int status, int memory_mb) {
                  "crash");
 }
 
+// Rounded up: a wait that ended a fraction of a millisecond early would find
+// the deadline not yet passed and wait for 0 ms again and again until it is.
 int MillisUntil(std::chrono::steady_clock::time_point when) {
   const auto left =
-      std::chrono::duration_cast<std::chrono::milliseconds>(when - std::chrono::steady_clock::now())
-          .count();
+      std::chrono::ceil<std::chrono::milliseconds>(when - std::chrono::steady_clock::now()).count();
   return static_cast<int>(std::max<long long>(0, std::min<long long>(left, INT_MAX)));
 }
 
@@ -215,6 +247,8 @@ bool ExtractService::SpawnWorker() {
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return false;
   FileDescriptor ours(ends[0]);
   FileDescriptor theirs(ends[1]);
+  ::setsockopt(theirs.get(), SOL_SOCKET, SO_SNDBUF, &kAnswerSocketBuffer,
+               sizeof(kAnswerSocketBuffer));  // best effort: the default also works
   const pid_t pid = ::fork();
   if (pid < 0) return false;
   if (pid == 0) BecomeWorker(theirs.get(), options_.memory_mb, extractor_);
@@ -315,6 +349,8 @@ void ExtractService::AcceptClients() {
       KALO_LOG(LOG_WARNING, "refused a client: %zu connections already", options_.max_connections);
       continue;  // closed as fd goes
     }
+    ::setsockopt(fd.get(), SOL_SOCKET, SO_SNDBUF, &kAnswerSocketBuffer,
+                 sizeof(kAnswerSocketBuffer));  // best effort: the default also works
     Client client;
     client.fd = std::move(fd);
     client.last_activity = Clock::now();
@@ -395,12 +431,16 @@ void ExtractService::HandleRequest(uint64_t id, const std::string& body) {
 }
 
 void ExtractService::Answer(uint64_t id, const Json::Value& answer, bool close_after) {
+  AnswerFrame(id, Frame(JsonText(answer)), close_after);
+}
+
+void ExtractService::AnswerFrame(uint64_t id, std::string frame, bool close_after) {
   auto it = clients_.find(id);
   if (it == clients_.end()) return;
   Client& client = it->second;
   client.waiting = false;
   client.close_after_write = close_after;
-  client.out = Frame(JsonText(answer));
+  client.out.swap(frame);
   client.out_done = 0;
   client.last_activity = Clock::now();
   WriteClient(id);
@@ -429,36 +469,70 @@ void ExtractService::WriteClient(uint64_t id) {
 
 void ExtractService::ReadWorker(size_t index) {
   Worker& worker = workers_[index];
-  char chunk[kReadChunk];
-  const ssize_t n = ::recv(worker.channel.get(), chunk, sizeof(chunk), 0);
-  if (n < 0 && (errno == EAGAIN || errno == EINTR)) return;
-  if (n <= 0) {
-    EndWorker(index, nullptr);  // it died: its status tells why
-    return;
-  }
-  worker.in.append(chunk, static_cast<size_t>(n));
-  std::string body;
-  bool too_large = false;
-  if (!TakeFrame(worker.in, kMaxAnswerBytes, body, &too_large)) {
-    if (too_large) {
-      const Json::Value broken = Failure("the parser's worker sent a broken answer", "crash");
-      EndWorker(index, &broken);
+  // What is there is read at once: an answer with a long text fills the
+  // channel's buffer several times over. Bounded, so that a worker gone
+  // wrong that never stops writing cannot hold the loop.
+  for (int reads = 0; reads < kReadsPerRound; ++reads) {
+    char chunk[kReadChunk];
+    const ssize_t n = ::recv(worker.channel.get(), chunk, sizeof(chunk), 0);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0 && errno == EAGAIN) break;
+    if (n <= 0) {
+      EndWorker(index, nullptr);  // it died: its status tells why
+      return;
     }
+    worker.in.append(chunk, static_cast<size_t>(n));
+    if (static_cast<size_t>(n) < sizeof(chunk)) break;
+  }
+  uint32_t length = 0;
+  if (worker.in.size() < sizeof(length)) return;
+  std::memcpy(&length, worker.in.data(), sizeof(length));
+  if (length > kMaxAnswerBytes) {
+    const Json::Value broken = Failure("the parser's worker sent a broken answer", "crash");
+    EndWorker(index, &broken);
     return;
   }
-  Json::Value answer;
-  if (!worker.ready && !worker.busy && ParseJson(body, answer) && answer["ready"].asBool()) {
+  const size_t frame_size = sizeof(length) + length;
+  if (worker.in.size() < frame_size) {
+    worker.in.reserve(frame_size);  // the rest comes without copying what is in
+    return;
+  }
+  std::string frame;
+  if (worker.in.size() == frame_size) {
+    frame.swap(worker.in);
+  } else {
+    frame.assign(worker.in, 0, frame_size);
+    worker.in.erase(0, frame_size);
+  }
+  // The answer goes to the client as the worker framed it: only its JSON
+  // header is read here, never the text behind it.
+  const char* body = frame.data() + sizeof(length);
+  const char* end = body + length;
+  if (end > body && end[-1] == '\0') --end;
+  const char* header_end = static_cast<const char*>(std::memchr(body, '\0', end - body));
+  if (header_end == nullptr) header_end = end;
+  Json::Value header;
+  const bool parsed = ParseJson(body, header_end, header) && header.isObject();
+  if (!worker.ready && !worker.busy && parsed && header["ready"].asBool()) {
     worker.ready = true;
     return;
   }
-  if (!worker.busy || !ParseJson(body, answer) || !answer.isObject()) {
+  if (!worker.busy || !parsed || !TextFits(header, header_end, end)) {
     const Json::Value broken = Failure("the parser's worker sent a broken answer", "crash");
     EndWorker(index, &broken);
     return;
   }
   worker.busy = false;
   worker.in.clear();
-  Answer(worker.client, answer, /*close_after=*/false);
+  const uint64_t client = worker.client;
+  AnswerFrame(client, std::move(frame), /*close_after=*/false);
+  // The client's last answer buffer, written by now, takes the next answer:
+  // a long one then lands in memory already mapped.
+  auto it = clients_.find(client);
+  if (it != clients_.end() && it->second.out.empty() && worker.in.empty() &&
+      it->second.out.capacity() <= kRecycledBufferBytes) {
+    worker.in.swap(it->second.out);
+  }
 }
 
 void ExtractService::EndWorker(size_t index, const Json::Value* fault_answer) {

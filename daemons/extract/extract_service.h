@@ -144,6 +144,7 @@ class ExtractService {
   void HandleRequest(uint64_t id, const std::string& body);
   void WriteClient(uint64_t id);
   void Answer(uint64_t id, const Json::Value& answer, bool close_after);
+  void AnswerFrame(uint64_t id, std::string frame, bool close_after);
   void ReadWorker(size_t index);
   void EndWorker(size_t index, const Json::Value* fault_answer);
   void ExpireDeadlines();

@@ -4,8 +4,10 @@
 
 #include <signal.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/time.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -13,6 +15,7 @@
 #include <cstring>
 #include <exception>
 #include <fstream>
+#include <memory>
 #include <new>
 #include <sstream>
 #include <string>
@@ -45,13 +48,105 @@ bool CurrentDataBytes(rlim_t& bytes) {
 // its parent recognises. Nothing is freed or logged: there is no memory.
 void OnOutOfMemory() { ::_exit(kExtractExitMemoryCap); }
 
+// Compact, and UTF-8 written as itself: escaping every non-ASCII character
+// as \uXXXX would make the reader's work grow sixfold. The writer and the
+// reader are made once: their settings cost more to build than a small
+// message costs to write or parse (one of each per thread).
 std::string JsonText(const Json::Value& value) {
-  Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
-  return Json::writeString(builder, value);
+  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = true;
+    return builder.newStreamWriter();
+  }());
+  std::ostringstream out;
+  writer->write(value, &out);
+  return out.str();
+}
+
+bool ParseJson(const std::string& text, Json::Value& value) {
+  thread_local const std::unique_ptr<Json::CharReader> reader(
+      Json::CharReaderBuilder().newCharReader());
+  std::string errors;
+  return reader->parse(text.data(), text.data() + text.size(), &value, &errors);
 }
 
 }  // namespace
+
+AnswerParts SplitAnswer(Json::Value answer) {
+  AnswerParts parts;
+  // Looked at through a const view, which adds no member that is absent.
+  const Json::Value& view = answer;
+  if (view.isObject() && view["data"].isObject() && view["data"][kExtractTextMember].isString()) {
+    answer["data"].removeMember(kExtractTextMember, &parts.text);
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    parts.text.getString(&begin, &end);
+    answer["text_bytes"] = static_cast<Json::UInt64>(end - begin);
+  }
+  parts.json = JsonText(answer);
+  return parts;
+}
+
+std::string AnswerMessage(Json::Value answer) {
+  const AnswerParts parts = SplitAnswer(std::move(answer));
+  if (!parts.text.isString()) return parts.json;
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  parts.text.getString(&begin, &end);
+  std::string message;
+  message.reserve(parts.json.size() + 1 + static_cast<size_t>(end - begin));
+  message += parts.json;
+  message += '\0';
+  message.append(begin, end);
+  return message;
+}
+
+bool WorkerChannel::SendAnswer(Json::Value answer) {
+  const AnswerParts parts = SplitAnswer(std::move(answer));
+  const char* text = nullptr;
+  const char* text_end = nullptr;
+  if (parts.text.isString()) parts.text.getString(&text, &text_end);
+  const size_t text_size = static_cast<size_t>(text_end - text);
+  const size_t length = parts.json.size() + 1 + (parts.text.isString() ? text_size + 1 : 0);
+  if (length > kalodaemon::kMaxMessageBytes) {
+    errno = EMSGSIZE;
+    return false;
+  }
+  const uint32_t length_word = static_cast<uint32_t>(length);
+  static const char kNul[1] = {'\0'};
+  // Written from where each part lies: the text, the bulk of an answer,
+  // is never copied into a frame of its own.
+  struct iovec parts_out[5] = {
+      {const_cast<uint32_t*>(&length_word), sizeof(length_word)},
+      {const_cast<char*>(parts.json.data()), parts.json.size()},
+      {const_cast<char*>(kNul), 1},
+      {const_cast<char*>(text), text_size},
+      {const_cast<char*>(kNul), parts.text.isString() ? 1u : 0u},
+  };
+  struct iovec* next = parts_out;
+  size_t left = 5;
+  while (left > 0) {
+    struct msghdr message = {};
+    message.msg_iov = next;
+    message.msg_iovlen = left;
+    // As Send: a daemon gone is an error here, never a SIGPIPE.
+    const ssize_t n = ::sendmsg(fd_.get(), &message, MSG_NOSIGNAL);
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return false;
+    size_t done = static_cast<size_t>(n);
+    while (left > 0 && done >= next->iov_len) {
+      done -= next->iov_len;
+      ++next;
+      --left;
+    }
+    if (left > 0) {
+      next->iov_base = static_cast<char*>(next->iov_base) + done;
+      next->iov_len -= done;
+    }
+  }
+  return true;
+}
 
 bool CapWorkerMemory(int memory_mb) {
   const struct rlimit no_core = {0, 0};
@@ -84,7 +179,7 @@ Json::Value ExtractInWorker(const std::string& path, const Extractor& extractor)
   }
   if (!data.isObject()) data = Json::Value(Json::objectValue);
   answer["ok"] = ok;
-  answer["data"] = data;
+  answer["data"] = std::move(data);  // it may hold a long text
   if (!ok) answer["reason"] = problem.empty() ? std::string("parser failed") : problem;
   return answer;
 }
@@ -123,17 +218,14 @@ void ServeWorker(FileDescriptor channel, int memory_mb, const Extractor& extract
   std::string request;
   while (link.Recv(request)) {
     Json::Value parsed;
-    Json::CharReaderBuilder builder;
-    std::string errors;
-    std::istringstream in(request);
     Json::Value answer;
-    if (!Json::parseFromStream(builder, in, &parsed, &errors) || !parsed["path"].isString()) {
+    if (!ParseJson(request, parsed) || !parsed["path"].isString()) {
       answer["ok"] = false;
       answer["reason"] = "bad request to worker";
     } else {
       answer = ExtractInWorker(parsed["path"].asString(), extractor);
     }
-    if (!link.Send(JsonText(answer))) break;
+    if (!link.SendAnswer(std::move(answer))) break;
   }
   ::_exit(0);  // the daemon closed our channel: it is done with us
 }

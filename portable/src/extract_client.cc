@@ -16,6 +16,8 @@
 #include <climits>
 #include <cstring>
 #include <ctime>
+#include <memory>
+#include <mutex>
 #include <sstream>
 #include <utility>
 #include <vector>
@@ -41,17 +43,60 @@ constexpr size_t kMaxProgramErrors = 4096;
 // long again) and what the round trip costs.
 constexpr int kDaemonSlackMs = 1000;
 
-bool ParseJson(const std::string& text, Json::Value& value) {
-  Json::CharReaderBuilder builder;
+bool ParseJson(const char* begin, const char* end, Json::Value& value) {
+  // Made once per thread: a reader's settings cost more to build than a
+  // small message costs to parse.
+  thread_local const std::unique_ptr<Json::CharReader> reader(
+      Json::CharReaderBuilder().newCharReader());
   std::string errors;
-  std::istringstream in(text);
-  return Json::parseFromStream(builder, in, &value, &errors);
+  return reader->parse(begin, end, &value, &errors);
+}
+
+bool ParseJson(const std::string& text, Json::Value& value) {
+  return ParseJson(text.data(), text.data() + text.size(), value);
 }
 
 std::string JsonText(const Json::Value& value) {
+  // Made once per thread, as the reader.
+  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = true;
+    return builder.newStreamWriter();
+  }());
+  std::ostringstream out;
+  writer->write(value, &out);
+  return out.str();
+}
+
+// For the failure record, which people read.
+std::string IndentedJsonText(const Json::Value& value) {
   Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
+  builder["indentation"] = " ";
+  builder["emitUTF8"] = true;
   return Json::writeString(builder, value);
+}
+
+// An answer from the socket: its JSON text, and when that announces
+// "text_bytes", the text behind its NUL put back into the data as the
+// property it is. False when the message is not such an answer.
+bool DecodeAnswer(const std::string& message, Json::Value& answer) {
+  const char* begin = message.data();
+  const char* end = begin + message.size();
+  const char* header_end = static_cast<const char*>(std::memchr(begin, '\0', message.size()));
+  if (header_end == nullptr) header_end = end;
+  if (!ParseJson(begin, header_end, answer) || !answer.isObject()) return false;
+  if (!answer.isMember("text_bytes")) return header_end == end;
+  const Json::Value& bytes = answer["text_bytes"];
+  if (!bytes.isUInt64() || header_end == end ||
+      static_cast<Json::UInt64>(end - header_end - 1) != bytes.asUInt64()) {
+    return false;
+  }
+  Json::Value& data = answer["data"];
+  if (!data.isObject()) data = Json::Value(Json::objectValue);
+  data[kExtractTextMember] = Json::Value(header_end + 1, end);
+  answer.removeMember("text_bytes");
+  return true;
 }
 
 int MillisLeft(Clock::time_point end) {
@@ -82,9 +127,38 @@ class DaemonConnection : public kalodaemon::DomainSockConnection {
   }
 };
 
-ExtractOutcome FromAnswer(const Json::Value& answer) {
+// The connection to the daemon kept by this thread between requests, so
+// that each file costs one round trip and no connection set-up. A process
+// forked since does not use its parent's: the two would read each other's
+// answers.
+// Its buffer for answers is kept too, up to kKeptBufferBytes: a long text
+// then lands in memory already mapped rather than in fresh pages each time.
+struct KeptConnection {
+  pid_t pid = -1;
+  std::unique_ptr<DaemonConnection> connection;
+  std::string buffer;
+};
+constexpr size_t kKeptBufferBytes = 4u << 20;
+thread_local KeptConnection t_kept;
+
+// The kept connection to socket_path, taken from the keeping; null when
+// there is none.
+std::unique_ptr<DaemonConnection> TakeKeptConnection(const std::string& socket_path) {
+  std::unique_ptr<DaemonConnection> connection = std::move(t_kept.connection);
+  if (connection == nullptr || t_kept.pid != ::getpid() || connection->path() != socket_path) {
+    return nullptr;  // closed: a forked child closes only its own copy
+  }
+  return connection;
+}
+
+void KeepConnection(std::unique_ptr<DaemonConnection> connection) {
+  t_kept.pid = ::getpid();
+  t_kept.connection = std::move(connection);
+}
+
+ExtractOutcome FromAnswer(Json::Value& answer) {
   ExtractOutcome outcome;
-  if (answer["data"].isObject()) outcome.data = answer["data"];
+  if (answer["data"].isObject()) outcome.data.swap(answer["data"]);
   outcome.reason = answer["reason"].asString();
   if (answer["ok"].asBool()) {
     outcome.kind = ExtractOutcome::kOk;
@@ -189,6 +263,25 @@ ExtractOutcome OutcomeOfExit(int status, const ChildOutput& output, int memory_m
   return Fault("the parser ended with status " + std::to_string(code));
 }
 
+// The last version of a failure record read in this process, known by its
+// file's identity, size and modification time.
+struct RecordCache {
+  std::string path;
+  dev_t dev = 0;
+  ino_t ino = 0;
+  off_t size = -1;
+  struct timespec mtime = {};
+  Json::Value files;
+
+  bool Matches(const std::string& record_path, const struct stat& st) const {
+    return path == record_path && dev == st.st_dev && ino == st.st_ino && size == st.st_size &&
+           mtime.tv_sec == st.st_mtim.tv_sec && mtime.tv_nsec == st.st_mtim.tv_nsec;
+  }
+};
+
+std::mutex g_record_mutex;
+RecordCache g_record_cache;  // under g_record_mutex
+
 bool MakeDirs(const std::string& dir) {
   for (size_t slash = dir.find('/', 1);; slash = dir.find('/', slash + 1)) {
     const std::string prefix = dir.substr(0, slash);
@@ -201,27 +294,46 @@ bool MakeDirs(const std::string& dir) {
 
 bool AskExtractDaemon(const std::string& socket_path, const std::string& path, int deadline_ms,
                       ExtractOutcome& outcome) {
-  DaemonConnection connection(socket_path);
-  if (!connection.Connect()) return false;
   Json::Value request(Json::objectValue);
   request["path"] = path;
   request["deadline_ms"] = deadline_ms;
-  if (!connection.Send(JsonText(request))) return false;
-  if (!connection.WaitForAnswer(2 * deadline_ms + kDaemonSlackMs)) {
-    outcome = Unavailable("the extraction service did not answer in time");
+  const std::string message = JsonText(request);
+  // A kept connection may have been closed by the daemon since (it drops
+  // idle ones, or it restarted): that one is given up and the request sent
+  // once more on a new connection.
+  for (;;) {
+    std::unique_ptr<DaemonConnection> connection = TakeKeptConnection(socket_path);
+    const bool kept = connection != nullptr;
+    if (!kept) {
+      connection.reset(new DaemonConnection(socket_path));
+      if (!connection->Connect()) return false;
+    }
+    if (!connection->Send(message)) {
+      if (kept) continue;
+      return false;
+    }
+    if (!connection->WaitForAnswer(2 * deadline_ms + kDaemonSlackMs)) {
+      outcome = Unavailable("the extraction service did not answer in time");
+      return true;  // the connection goes: its late answer must not be read as the next one's
+    }
+    std::string& text = t_kept.buffer;
+    // A daemon that closes without answering (stopping, or full) is as good
+    // as none: the one-shot mode takes over.
+    if (!connection->Recv(text)) {
+      if (kept) continue;
+      return false;
+    }
+    Json::Value answer;
+    const bool decoded = DecodeAnswer(text, answer);
+    if (text.capacity() > kKeptBufferBytes) std::string().swap(text);
+    if (!decoded) {
+      outcome = Unavailable("the extraction service answered with no JSON object");
+      return true;
+    }
+    outcome = FromAnswer(answer);
+    KeepConnection(std::move(connection));
     return true;
   }
-  std::string text;
-  Json::Value answer;
-  // A daemon that closes without answering (stopping, or full) is as good
-  // as none: the one-shot mode takes over.
-  if (!connection.Recv(text)) return false;
-  if (!ParseJson(text, answer) || !answer.isObject()) {
-    outcome = Unavailable("the extraction service answered with no JSON object");
-    return true;
-  }
-  outcome = FromAnswer(answer);
-  return true;
 }
 
 ExtractOutcome RunExtractProgram(const std::string& program, const std::string& path,
@@ -297,7 +409,22 @@ Json::Value ExtractFailureRecord::Load() const {
 
 ExtractFailureRecord::State ExtractFailureRecord::Lookup(const std::string& path,
                                                          const struct statx& st) const {
-  const Json::Value files = Load();
+  // Asked once per extracted file: the record is read and parsed again only
+  // when it has been replaced or changed since (writes replace it whole, so
+  // a new version is a new inode).
+  struct stat record_st;
+  if (::stat(path_.c_str(), &record_st) != 0) return kAbsent;
+  std::lock_guard<std::mutex> hold(g_record_mutex);
+  RecordCache& cache = g_record_cache;
+  if (!cache.Matches(path_, record_st)) {
+    cache.path = path_;
+    cache.dev = record_st.st_dev;
+    cache.ino = record_st.st_ino;
+    cache.size = record_st.st_size;
+    cache.mtime = record_st.st_mtim;
+    cache.files = Load();
+  }
+  const Json::Value& files = cache.files;
   if (!files.isMember(path)) return kAbsent;
   const Json::Value& entry = files[path];
   const bool same = entry["size"].asUInt64() == st.stx_size &&
@@ -349,9 +476,12 @@ bool ExtractFailureRecord::Save(const Json::Value& files) {
   Json::Value record(Json::objectValue);
   record["version"] = 1;
   record["files"] = files;
-  Json::StreamWriterBuilder builder;
-  builder["indentation"] = " ";
-  return WriteFileAtomic(path_, Json::writeString(builder, record) + "\n", 0644);
+  const bool saved = WriteFileAtomic(path_, IndentedJsonText(record) + "\n", 0644);
+  // A version written here is never taken for the one read before it,
+  // however coarse the file system's clock.
+  std::lock_guard<std::mutex> hold(g_record_mutex);
+  g_record_cache.path.clear();
+  return saved;
 }
 
 }  // namespace portable

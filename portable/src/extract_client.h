@@ -2,8 +2,9 @@
 // daemon, running the one-shot program in a child of our own, and the record
 // of files whose extraction crashed, hung or ran out of memory. Nothing here
 // parses a file: the parsers only ever run in another process.
-// Thread-safe: no shared state in the process (the record file is shared
-// between processes through a lock file).
+// Thread-safe: the only state in the process is the last failure record
+// read, under a lock (the record file is shared between processes through a
+// lock file).
 #ifndef ORVEX_PORTABLE_SRC_EXTRACT_CLIENT_H_
 #define ORVEX_PORTABLE_SRC_EXTRACT_CLIENT_H_
 
@@ -28,8 +29,10 @@ struct ExtractOutcome {
 };
 
 // Asks the daemon listening on socket_path (resolved) to extract path,
-// waiting at most about twice deadline_ms. False when nothing answers the
-// connection (no socket, or no daemon on it): run the one-shot mode then.
+// waiting at most about twice deadline_ms. The calling thread keeps its
+// connection for the next request (a forked child makes its own). False
+// when nothing answers the connection (no socket, or no daemon on it): run
+// the one-shot mode then.
 bool AskExtractDaemon(const std::string& socket_path, const std::string& path, int deadline_ms,
                       ExtractOutcome& outcome);
 

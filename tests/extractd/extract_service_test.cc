@@ -39,6 +39,10 @@ constexpr bool kSanitized = false;
 constexpr int kDeadlineMs = 300;
 constexpr int kMemoryMb = 64;
 
+// A text as a parser may give it: UTF-8 beyond ASCII, quotes, a backslash
+// and a NUL, none of which may be escaped on its way to the caller.
+constexpr char kText[] = "caf\xc3\xa9 \"\xe4\xbc\x9a\xe8\xad\xb0\"\\\n\0end";
+
 bool EndsWith(const std::string& text, const std::string& suffix) {
   return text.size() >= suffix.size() &&
          text.compare(text.size() - suffix.size(), suffix.size(), suffix) == 0;
@@ -59,6 +63,11 @@ bool TestExtractor(const std::string& path, Json::Value& out, std::string* probl
       std::memset(kept.back(), 1, 1 << 20);
     }
     ::_exit(99);  // the cap did not stop it
+  }
+  if (EndsWith(path, ".text")) {
+    out["KALOMDTitle"] = "with text";
+    out["KALOMDTextContent"] = std::string(kText, sizeof(kText) - 1);
+    return true;
   }
   if (EndsWith(path, ".bad")) {
     out["KALOMDTitle"] = "partial";
@@ -106,27 +115,46 @@ class ExtractServiceTest : public ::testing::Test {
   }
 
   // Steps the service until fd has something to read (or is closed), then
-  // reads one answer; null when the service closed the connection instead.
-  Json::Value Receive(const FileDescriptor& fd) {
+  // reads one message; empty when the service closed the connection instead.
+  std::string ReceiveBody(const FileDescriptor& fd) {
     struct pollfd pfd = {fd.get(), POLLIN, 0};
     for (int round = 0; round < 1000 && ::poll(&pfd, 1, 0) == 0; ++round) {
       service_->RunOnce(50);
     }
     if (::poll(&pfd, 1, 0) == 0) {  // never block the suite on a lost answer
       ADD_FAILURE() << "no answer after 1000 steps of the service";
-      return Json::Value();
+      return std::string();
     }
     uint32_t length = 0;
     if (::recv(fd.get(), &length, sizeof(length), MSG_WAITALL) != sizeof(length)) {
-      return Json::Value();
+      return std::string();
     }
     std::string body(length, '\0');
-    EXPECT_EQ(static_cast<ssize_t>(length), ::recv(fd.get(), &body[0], length, MSG_WAITALL));
+    // A long answer arrives as the service writes it: keep stepping it.
+    for (size_t done = 0; done < length;) {
+      const ssize_t n = ::recv(fd.get(), &body[done], length - done, MSG_DONTWAIT);
+      if (n > 0) {
+        done += static_cast<size_t>(n);
+      } else if (n == 0) {
+        ADD_FAILURE() << "the answer was cut short";
+        return std::string();
+      } else {
+        service_->RunOnce(50);
+      }
+    }
     if (!body.empty() && body.back() == '\0') body.pop_back();
+    return body;
+  }
+
+  // One answer's JSON text (up to the NUL that a text may follow), parsed;
+  // null when the service closed the connection instead.
+  Json::Value Receive(const FileDescriptor& fd) {
+    const std::string body = ReceiveBody(fd);
+    if (body.empty()) return Json::Value();
     Json::Value answer;
     Json::CharReaderBuilder builder;
     std::string errors;
-    std::istringstream in(body);
+    std::istringstream in(body.substr(0, body.find('\0')));
     EXPECT_TRUE(Json::parseFromStream(builder, in, &answer, &errors)) << body;
     return answer;
   }
@@ -171,6 +199,29 @@ TEST_F(ExtractServiceTest, AnswersWithTheParsersProperties) {
   EXPECT_TRUE(answer["ok"].asBool()) << answer;
   EXPECT_EQ("report.txt", answer["data"]["KALOMDTitle"].asString());
   EXPECT_FALSE(answer.isMember("fault"));
+}
+
+TEST_F(ExtractServiceTest, TextFollowsTheAnswersJsonTextAsItsOwnBytes) {
+  const FileDescriptor fd = Connect();
+  SendRaw(fd, Framed("{\"path\": \"" + File("long.text") + "\"}"));
+  const std::string body = ReceiveBody(fd);
+  const size_t nul = body.find('\0');
+  ASSERT_NE(std::string::npos, nul) << body;
+  Json::Value answer;
+  Json::CharReaderBuilder builder;
+  std::string errors;
+  std::istringstream in(body.substr(0, nul));
+  ASSERT_TRUE(Json::parseFromStream(builder, in, &answer, &errors)) << body;
+  EXPECT_TRUE(answer["ok"].asBool()) << answer;
+  EXPECT_EQ("with text", answer["data"]["KALOMDTitle"].asString());
+  EXPECT_FALSE(answer["data"].isMember("KALOMDTextContent"));
+  const std::string text(kText, sizeof(kText) - 1);
+  EXPECT_EQ(text.size(), answer["text_bytes"].asUInt64());
+  EXPECT_EQ(text, body.substr(nul + 1));
+  // The same connection carries the next request, without a text.
+  SendRaw(fd, Framed("{\"path\": \"" + File("next.txt") + "\"}"));
+  const std::string next = ReceiveBody(fd);
+  EXPECT_EQ(std::string::npos, next.find('\0')) << next;
 }
 
 TEST_F(ExtractServiceTest, CorruptFileGivesWhatWasReadAndNoFault) {

@@ -307,6 +307,21 @@ TEST_P(IsolatedExtractTest, NextNormalFileExtractsAfterEachFault) {
   EXPECT_EQ(Runs(6), Calls().size());
 }
 
+// The text reaches the caller byte for byte, whichever way it travels, and
+// one request after another is answered.
+TEST_P(IsolatedExtractTest, TextBeyondAsciiArrivesUnchanged) {
+  const std::string words =
+      "Gr\xc3\xb6\xc3\x9f"
+      "e \"caf\xc3\xa9\" \xe4\xbc\x9a\xe8\xad\xb0 back\\slash";
+  for (int i = 0; i < 3; ++i) {
+    const std::string name = "note" + std::to_string(i) + ".txt";
+    const Json::Value doc = Parse(files_.Write(name, words + "\n"));
+    EXPECT_EQ(name, doc["KALOMDFSName"].asString());
+    EXPECT_NE(std::string::npos, doc["KALOMDTextContent"].asString().find(words)) << doc;
+  }
+  EXPECT_EQ(Runs(3), Calls().size());
+}
+
 TEST_P(IsolatedExtractTest, FifoAndLinkToDevZeroGiveAttributesUnopened) {
   const std::string fifo = files_.Join("pipe.hang");
   ASSERT_EQ(0, ::mkfifo(fifo.c_str(), 0600));

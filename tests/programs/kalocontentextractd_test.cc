@@ -75,9 +75,16 @@ class KalocontentextractdTest : public ProgramTest {
     Json::Value request;
     request["path"] = path;
     EXPECT_TRUE(connection.Send(toString(request)));
-    std::string answer;
-    EXPECT_TRUE(connection.Recv(answer));
-    return Parse(answer);
+    std::string message;
+    EXPECT_TRUE(connection.Recv(message));
+    // A text travels after the JSON text's NUL, announced by "text_bytes".
+    const size_t nul = message.find('\0');
+    Json::Value answer = Parse(message.substr(0, nul));
+    if (nul != std::string::npos) {
+      EXPECT_EQ(message.size() - nul - 1, answer["text_bytes"].asUInt64()) << message;
+      answer["data"][orvex::portable::kExtractTextMember] = message.substr(nul + 1);
+    }
+    return answer;
   }
 
   // Raw bytes on a fresh connection, left open.
@@ -161,6 +168,7 @@ TEST_F(KalocontentextractdTest, DaemonSurvivesGarbageHugeLengthsAndFaultyFiles) 
   EXPECT_TRUE(Ask(Write("files/b.hog", "x"))["fault"].isString());
   const Json::Value fine = Ask(Write("files/fine.txt", "text"));
   EXPECT_TRUE(fine["ok"].asBool()) << fine;
+  EXPECT_NE(std::string::npos, fine["data"]["KALOMDTextContent"].asString().find("text")) << fine;
   // The huge length was refused with an answer, then the connection closed.
   char buffer[256];
   const ssize_t n = ::recv(huge.get(), buffer, sizeof(buffer), 0);

@@ -6,7 +6,9 @@
 // another process, never this one: the extraction daemon when it runs,
 // otherwise the one-shot program run as a child (see
 // orvex/portable/extract_protocol.h and doc/content_extraction.md).
-// Thread-safe: no shared state in the process.
+// Thread-safe: each thread keeps its own connection to the daemon between
+// calls; what else the process keeps (the failure record last read) is
+// under a lock.
 // Who may include it: in the library, only the platform layer (src/platform/),
 // the one door through which every subsystem reaches the platform, and the
 // foundation beneath it; the programs and the tests may include it freely.

@@ -1,7 +1,8 @@
 // What the content-extraction service and its callers agree on: where the
 // daemon's socket, pid file and program live, the failure record, the
-// default limits, and the exit statuses of the program's one-shot mode.
-// doc/content_extraction.md describes the socket's messages. Constants only.
+// property carried outside the answers' JSON text, the default limits, and
+// the exit statuses of the program's one-shot mode. doc/content_extraction.md
+// describes the socket's messages. Constants only.
 #ifndef ORVEX_PORTABLE_EXTRACT_PROTOCOL_H_
 #define ORVEX_PORTABLE_EXTRACT_PROTOCOL_H_
 
@@ -13,6 +14,11 @@ constexpr char kExtractSocketPath[] = "/var/run/kalocontentextractd.sock";
 constexpr char kExtractPidPath[] = "/var/run/kalocontentextractd.pid";
 constexpr char kExtractProgramPath[] = "/usr/kalo/bin/kalocontentextractd";
 constexpr char kExtractFailuresPath[] = "/var/lib/orvex/extract_failures.json";
+
+// The property that carries a file's text. In an answer on the socket it
+// travels outside the JSON text, as raw bytes after its NUL, announced by
+// the answer's "text_bytes" (see doc/content_extraction.md).
+constexpr char kExtractTextMember[] = "KALOMDTextContent";
 
 constexpr int kDefaultExtractDeadlineMs = 10000;
 constexpr int kDefaultExtractMemoryMb = 512;
