@@ -7,7 +7,6 @@
 //   kalocontentextractd --extract PATH [--deadline-ms MS] [--memory-mb MB]
 #include <fcntl.h>
 #include <signal.h>
-#include <sys/signalfd.h>
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -22,6 +21,7 @@
 #include "extract_service.h"
 #include "faults.h"
 #include "orvex/portable/atomic_file.h"
+#include "orvex/portable/daemon_process.h"
 #include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
 #include "orvex/version.h"
@@ -136,51 +136,12 @@ int ExtractOne(const Options& opt) {
   return status;
 }
 
-// SIGTERM and SIGINT arrive through a descriptor the loop waits on, so a
-// stop is seen at once and never between a check and a wait.
-orvex::FileDescriptor StopSignals() {
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGTERM);
-  sigaddset(&stop, SIGINT);
-  ::sigprocmask(SIG_BLOCK, &stop, nullptr);
-  ::signal(SIGPIPE, SIG_IGN);
-  return orvex::FileDescriptor(::signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK));
-}
-
-// Detaches: the parent returns once the child says its socket is ready (one
-// byte on the pipe) or has failed (the pipe closes empty), so that whoever
-// started the daemon can use it as soon as the command returns.
-int Detach(orvex::FileDescriptor& ready) {
-  int fds[2];
-  if (::pipe2(fds, O_CLOEXEC) != 0) return kExitFailure;
-  orvex::FileDescriptor read_end(fds[0]);
-  ready.reset(fds[1]);
-  const pid_t pid = ::fork();
-  if (pid < 0) return kExitFailure;
-  if (pid > 0) {
-    ready.reset();
-    char byte = 0;
-    ssize_t n;
-    while ((n = ::read(read_end.get(), &byte, 1)) < 0 && errno == EINTR) {
-    }
-    return n == 1 ? 0 : kExitFailure;
-  }
-  ::setsid();
-  if (::chdir("/") != 0) return kExitFailure;
-  const orvex::FileDescriptor null(::open("/dev/null", O_RDWR | O_CLOEXEC));
-  for (int fd = 0; fd <= 2; ++fd) ::dup2(null.get(), fd);
-  return -1;  // in the daemon: go on
-}
-
 int Serve(const Options& opt) {
   orvex::FileDescriptor ready;
-  if (!opt.foreground) {
-    const int status = Detach(ready);
-    if (status >= 0) return status;
-  }
+  const int started = orvex::portable::DetachUnlessForeground(opt.foreground, ready);
+  if (started >= 0) return started;  // the starter, told how the start went
   ::openlog(kIdent, LOG_PID, LOG_DAEMON);
-  orvex::FileDescriptor stop = StopSignals();
+  orvex::FileDescriptor stop = orvex::portable::BlockStopSignals();
   ExtractServiceOptions options;
   options.socket_path = RootPath(orvex::portable::kExtractSocketPath);
   options.workers = opt.workers;
@@ -195,11 +156,7 @@ int Serve(const Options& opt) {
   }
   service.set_wake_fd(stop.get());
   const std::string pid_path = RootPath(orvex::portable::kExtractPidPath);
-  if (!opt.foreground) {
-    orvex::portable::WriteFileAtomic(pid_path, std::to_string(::getpid()) + "\n");
-    WriteAll(ready.get(), "r");
-    ready.reset();
-  }
+  if (!orvex::portable::AnnounceReady(ready, pid_path)) return kExitFailure;
   syslog(LOG_INFO, "listening on %s with %d workers", options.socket_path.c_str(), opt.workers);
   while (!service.RunOnce(kRoundMs)) {
   }
