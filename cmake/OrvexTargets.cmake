@@ -110,6 +110,10 @@ function(orvex_programs)
           # The watcher's loop lives in its own library, which its tests share.
           target_link_libraries(${prog} PRIVATE orvex_watch)
         endif()
+        if(prog STREQUAL "fileindexd")
+          # The indexing daemon's loop lives in its own library, which its tests share.
+          target_link_libraries(${prog} PRIVATE orvex_indexd)
+        endif()
         if(prog STREQUAL "kalopmxnotify" OR prog STREQUAL "kalocontentextractd")
           # The library runs these tools from the platform's own fixed place
           # (under ORVEX_ROOT when that is set).

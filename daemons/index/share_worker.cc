@@ -1,0 +1,422 @@
+#include "index/share_worker.h"
+
+#include <dirent.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <exception>
+#include <utility>
+#include <vector>
+
+#include "elastic/channel.h"
+#include "orvex/elastic.h"
+#include "orvex/foundation/error.h"
+#include "orvex/foundation/log.h"
+#include "orvex/foundation/system_hooks.h"
+#include "orvex/foundation/util.h"
+#include "orvex/queue/queue_mgr.h"
+#include "orvex/status/status_mgr.h"
+
+namespace orvex {
+namespace indexd {
+
+namespace el = fileindex::elastic;
+using fileindex::OP;
+
+namespace {
+
+bool IsMetadataName(const std::string& name) {
+  return name == "@eaDir" || name == "#recycle" || name == "#snapshot";
+}
+
+bool Exists(const std::string& path, bool& is_dir) {
+  struct stat st;
+  if (::lstat(path.c_str(), &st) != 0) return false;
+  is_dir = S_ISDIR(st.st_mode);
+  return true;
+}
+
+// The entries of dir by name; empty when it cannot be read (it may have
+// gone since it was queued: its own delete event follows).
+std::vector<std::string> ListDir(const std::string& dir) {
+  std::vector<std::string> names;
+  DIR* d = ::opendir(dir.c_str());
+  if (d == nullptr) return names;
+  while (const dirent* entry = ::readdir(d)) {
+    const std::string name = entry->d_name;
+    if (name != "." && name != "..") names.push_back(name);
+  }
+  ::closedir(d);
+  std::sort(names.begin(), names.end());
+  return names;
+}
+
+}  // namespace
+
+ShareWorker::ShareWorker(std::string share, std::string share_root, std::string queue_path,
+                         WorkerOptions options)
+    : share_(std::move(share)),
+      share_root_(std::move(share_root)),
+      queue_path_(std::move(queue_path)),
+      options_(options) {}
+
+void ShareWorker::ScheduleFullWalk() {
+  actions_.push_back({Kind::kReindex, share_root_, ""});
+  full_walk_ = true;
+  if (!in_batch_) {
+    in_batch_ = true;
+    from_snapshot_ = false;
+    batch_start_ = Now();
+    done_ = 0;
+  }
+}
+
+bool ShareWorker::HasWork() const { return in_batch_ && retry_at_ <= Now(); }
+
+size_t ShareWorker::Step() {
+  const time_t now = Now();
+  if (retry_at_ > now) return 0;
+  size_t sent = 0;
+  try {
+    if (!in_batch_) {
+      if (!SnapshotDue()) return 0;
+      TakeSnapshot();
+    }
+    if (!folders_) folders_ = std::make_unique<fileindex::FolderMgr>();
+    while (sent < options_.step_budget && !actions_.empty()) {
+      const Action action = actions_.front();
+      actions_.pop_front();
+      size_t n = 0;
+      try {
+        n = Perform(action);
+      } catch (const Error& e) {
+        if (e.code() != kErrorParseDocument) {
+          actions_.push_front(action);
+          throw;
+        }
+        // The file could not be read (it went, or it is not ours to read):
+        // its own later event, or the next re-index, puts it right.
+        LogPlain("fileindexd: share %s: skipped %s: %s", share_.c_str(), action.path.c_str(),
+                 e.what());
+      }
+      sent += n;
+      CountSent(n);
+    }
+    if (actions_.empty()) FinishBatch();
+    last_error_.clear();
+  } catch (const std::exception& e) {
+    last_error_ = e.what();
+    retry_at_ = now + options_.retry_s;
+    LogPlain("fileindexd: share %s: batch stopped, retry in %lds: %s", share_.c_str(),
+             static_cast<long>(options_.retry_s), e.what());
+  }
+  return sent;
+}
+
+bool ShareWorker::SnapshotDue() {
+  if (IsFileExist(queue_path_ + ".tmp")) return true;  // left by a run that did not finish
+  struct stat st;
+  if (::stat(queue_path_.c_str(), &st) != 0 || st.st_size == 0) {
+    seen_size_ = 0;
+    first_seen_ = 0;
+    return false;
+  }
+  const time_t now = Now();
+  if (st.st_size != seen_size_) {
+    seen_size_ = st.st_size;
+    seen_change_ = now;
+    if (first_seen_ == 0) first_seen_ = now;
+  }
+  return now - seen_change_ >= options_.quiet_s || now - first_seen_ >= options_.max_wait_s;
+}
+
+void ShareWorker::TakeSnapshot() {
+  // The folder list of the moment governs the whole batch.
+  folders_ = std::make_unique<fileindex::FolderMgr>();
+  fileindex::QueueMgr queue(queue_path_);
+  queue.ProcessOP([this](std::shared_ptr<OP> op) { AddOp(op); }, /*use_tmp=*/true);
+  in_batch_ = true;
+  from_snapshot_ = true;
+  batch_start_ = Now();
+  done_ = 0;
+  seen_size_ = 0;
+  first_seen_ = 0;
+}
+
+void ShareWorker::AddOp(const std::shared_ptr<OP>& op) {
+  const std::string path = op->node->GetPath();
+  switch (op->kind) {
+    case fileindex::OP_DELETE:
+      actions_.push_back({Kind::kDelete, path, ""});
+      break;
+    case fileindex::OP_UPSERT:
+      actions_.push_back({Kind::kUpsert, path, ""});
+      break;
+    case fileindex::OP_ATTR:
+      actions_.push_back({Kind::kAttr, path, ""});
+      break;
+    case fileindex::OP_RENAME:
+      actions_.push_back({Kind::kRename, path, op->path});
+      break;
+    // A configuration change may switch metadata on or off for some file
+    // types or remove the folder: the subtree is indexed again as it now
+    // stands.
+    case fileindex::OP_UPDATE_CFG:
+      actions_.push_back({Kind::kReindex, path, "", /*refresh=*/true});
+      break;
+    case fileindex::OP_REINDEX:
+      actions_.push_back({Kind::kReindex, path, "", false});
+      break;
+    case fileindex::OP_QUEUE_CRASHED:
+      actions_.push_back({Kind::kReindex, share_root_, "", false});
+      break;
+    case fileindex::OP_NONE:
+      break;
+  }
+}
+
+size_t ShareWorker::Perform(const Action& action) {
+  switch (action.kind) {
+    case Kind::kDelete:
+      return Remove(action.path, /*with_descendants=*/false);
+    case Kind::kUpsert:
+      return Upsert(action.path, /*attr_only=*/false);
+    case Kind::kAttr:
+      return Upsert(action.path, /*attr_only=*/true);
+    case Kind::kRename:
+      return Rename(action.from, action.path);
+    case Kind::kReindex:
+      return Reindex(action.path, action.refresh);
+    case Kind::kWalk:
+      Walk(action.path, action.refresh);
+      return 0;
+    case Kind::kSweep:
+      return Sweep(action.path);
+  }
+  return 0;
+}
+
+// What is gone is removed and what remains is indexed again. Files whose
+// size and change times match their document are not read again unless the
+// folder's settings changed (refresh); documents the walk does not find are
+// deleted at its end, so nothing vanishes from searches meanwhile.
+size_t ShareWorker::Reindex(const std::string& path, bool refresh) {
+  bool is_dir = false;
+  if (IsDocument(path) && Exists(path, is_dir)) {
+    if (is_dir) LearnKnown(path);
+    const size_t sent = Upsert(path, /*attr_only=*/false);
+    if (is_dir) {
+      actions_.push_front({Kind::kSweep, path, "", false});
+      actions_.push_front({Kind::kWalk, path, "", refresh});
+    }
+    return sent;
+  }
+  // A path that is no document itself may still hold indexed folders (the
+  // share root of a crashed queue, a renamed share): they are walked, and
+  // what else the index holds below the path goes.
+  const std::vector<std::string> below = FoldersBelow(path);
+  if (below.empty() || !Exists(path, is_dir) || InMetadataFolder(path)) {
+    return Remove(path, /*with_descendants=*/true);
+  }
+  LearnKnown(path);
+  actions_.push_front({Kind::kSweep, path, "", false});
+  for (auto it = below.rbegin(); it != below.rend(); ++it) {
+    if (*it != path) actions_.push_front({Kind::kReindex, *it, "", refresh});
+  }
+  return 0;
+}
+
+void ShareWorker::Walk(const std::string& dir, bool refresh) {
+  std::vector<Action> found;
+  for (const std::string& name : ListDir(dir)) {
+    if (IsMetadataName(name)) continue;
+    const std::string path = dir + "/" + name;
+    bool is_dir = false;
+    if (!Exists(path, is_dir)) continue;
+    const bool unchanged = Unchanged(path);
+    if (refresh || !unchanged) found.push_back({Kind::kUpsert, path, "", false});
+    // Links are documents of their own and never followed.
+    if (is_dir) found.push_back({Kind::kWalk, path, "", refresh});
+  }
+  actions_.insert(actions_.begin(), found.begin(), found.end());
+}
+
+void ShareWorker::LearnKnown(const std::string& dir) {
+  Json::Value request(Json::objectValue);
+  request["command"] = "document_get_by_query";
+  request["data"]["id"] = el::GetFileIndexID(share_);
+  request["data"]["query"]["qsl"]["prefix"]["KALOMDPath"] = dir + "/";
+  Json::Value answer;
+  el::SendWithRetry(answer, request);
+  if (!answer["data"].isArray()) {
+    throw Error(kErrorSearchDaemon, "document_get_by_query answer without data: " + dir);
+  }
+  const auto number = [](const Json::Value& v) { return v.isNumeric() ? v.asInt64() : -1; };
+  for (const Json::Value& doc : answer["data"]) {
+    if (!doc["KALOMDPath"].isString()) continue;
+    Known known;
+    known.size = number(doc["KALOMDFSSize"]);
+    known.ctime = number(doc["KALOMDAttributeChangeDate"]);
+    known.mtime = number(doc["KALOMDFSContentChangeDate"]);
+    // A nested walk (a folder below a share root) must not forget what an
+    // outer one has already seen.
+    known_.emplace(doc["KALOMDPath"].asString(), known);
+  }
+}
+
+bool ShareWorker::Unchanged(const std::string& path) {
+  const auto it = known_.find(path);
+  if (it == known_.end()) return false;
+  it->second.seen = true;
+  struct stat st;
+  if (::lstat(path.c_str(), &st) != 0) return false;
+  return it->second.size == st.st_size && it->second.ctime == st.st_ctim.tv_sec &&
+         it->second.mtime == st.st_mtim.tv_sec;
+}
+
+size_t ShareWorker::Sweep(const std::string& dir) {
+  const std::string prefix = dir + "/";
+  size_t sent = 0;
+  auto it = known_.lower_bound(prefix);
+  while (it != known_.end() && StringStartWith(it->first, prefix)) {
+    if (!it->second.seen) {
+      el::IndexDel(share_, it->first);
+      ++sent;
+    }
+    // Forgotten only once deleted: a failed delete is tried again.
+    it = known_.erase(it);
+  }
+  return sent;
+}
+
+size_t ShareWorker::Rename(const std::string& from, const std::string& to) {
+  const bool from_doc = IsDocument(from);
+  const bool to_doc = IsDocument(to);
+  if (from_doc && to_doc) {
+    el::IndexRename(share_, from, to);
+    return 1;
+  }
+  if (from_doc) return Remove(from, /*with_descendants=*/true);  // moved out of the index
+  if (to_doc) {
+    actions_.push_front({Kind::kReindex, to, ""});  // moved in: nothing to move
+    return 0;
+  }
+  // A renamed share root: the indexed folders below it move with it.
+  if (!FoldersBelow(to).empty()) {
+    el::IndexRename(share_, from, to);
+    return 1;
+  }
+  return 0;
+}
+
+size_t ShareWorker::Upsert(const std::string& path, bool attr_only) {
+  if (!IsDocument(path)) return 0;
+  bool is_dir = false;
+  if (!Exists(path, is_dir)) {
+    el::IndexDel(share_, path);  // gone before its turn came
+    return 1;
+  }
+  if (attr_only) {
+    el::IndexAttr(share_, path);
+  } else {
+    el::IndexUpsert(share_, path, folders_->IsFullPathNeedMeta(path));
+  }
+  return 1;
+}
+
+size_t ShareWorker::Remove(const std::string& path, bool with_descendants) {
+  if (InMetadataFolder(path)) return 0;  // never a document
+  el::IndexDel(share_, path);
+  if (!with_descendants) return 1;
+  el::IndexDelDir(share_, path);
+  return 2;
+}
+
+void ShareWorker::CountSent(size_t sent) {
+  since_commit_ += sent;
+  done_ += sent;
+  total_done_ += sent;
+  if (since_commit_ >= options_.commit_every) {
+    el::IndexCommit(share_);
+    since_commit_ = 0;
+  }
+}
+
+void ShareWorker::FinishBatch() {
+  if (since_commit_ > 0) {
+    el::IndexCommit(share_);
+    since_commit_ = 0;
+  }
+  // Only now, with everything committed, may the snapshot go: a run killed
+  // before this point finds it again and starts the batch over.
+  if (from_snapshot_) fileindex::QueueMgr(queue_path_).DeleteTmp();
+  if (full_walk_) {
+    fileindex::StatusMgr().UnsetShareStatus(share_, fileindex::NeedReindex);
+    full_walk_ = false;
+  }
+  in_batch_ = false;
+  from_snapshot_ = false;
+  folders_.reset();
+}
+
+bool ShareWorker::IsDocument(const std::string& path) const {
+  if (InMetadataFolder(path) || !folders_) return false;
+  try {
+    return folders_->GetMostSuitableCfg(path) != nullptr;
+  } catch (const Error&) {
+    return false;  // a folder of a share that is gone governs nothing
+  }
+}
+
+bool ShareWorker::InMetadataFolder(const std::string& path) {
+  size_t start = 0;
+  while (start <= path.size()) {
+    size_t end = path.find('/', start);
+    if (end == std::string::npos) end = path.size();
+    if (IsMetadataName(path.substr(start, end - start))) return true;
+    start = end + 1;
+  }
+  return false;
+}
+
+std::vector<std::string> ShareWorker::FoldersBelow(const std::string& path) const {
+  std::vector<std::string> below;
+  if (!folders_) return below;
+  for (const auto& folder : folders_->GetFolders()) {
+    try {
+      if (folder->GetShare() != share_) continue;
+      const std::string full = folder->GetFullPath();
+      if (full == path || StringStartWith(full, path + "/")) below.push_back(full);
+    } catch (const Error&) {
+    }
+  }
+  return below;
+}
+
+Json::Value ShareWorker::Status() const {
+  const time_t now = Now();
+  Json::Value out(Json::objectValue);
+  if (retry_at_ > now) {
+    out["state"] = "retrying";
+  } else if (in_batch_) {
+    out["state"] = "indexing";
+  } else if (seen_size_ > 0) {
+    out["state"] = "waiting";
+  } else {
+    out["state"] = "idle";
+  }
+  const double elapsed = static_cast<double>(std::max<time_t>(1, now - batch_start_));
+  const double rate = in_batch_ ? static_cast<double>(done_) / elapsed : 0.0;
+  out["done"] = static_cast<Json::Int64>(done_);
+  out["todo"] = static_cast<Json::Int64>(actions_.size());
+  out["rate"] = rate;
+  out["eta"] = rate > 0 ? static_cast<Json::Int64>(static_cast<double>(actions_.size()) / rate)
+                        : static_cast<Json::Int64>(-1);
+  out["total_done"] = static_cast<Json::Int64>(total_done_);
+  out["last_error"] = last_error_;
+  return out;
+}
+
+}  // namespace indexd
+}  // namespace orvex

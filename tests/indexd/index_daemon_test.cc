@@ -1,0 +1,503 @@
+// The indexing daemon driven step by step over real sockets and files: a
+// search daemon stand-in records the document commands, the daemon's own
+// socket is reached through the library's SendCommandToDaemon, and time runs
+// only when a test moves the clock.
+#include "index/index_daemon.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdint>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "elastic/elastic_peer.h"
+#include "orvex/communication.h"
+#include "orvex/foundation/json.h"
+#include "orvex/foundation/system_hooks.h"
+#include "platform/share_test_root.h"
+#include "support/log_capture.h"
+
+namespace orvex {
+namespace indexd {
+namespace {
+
+using testing::ElasticPeer;
+
+constexpr time_t kStart = 1700000000;
+constexpr int kMaxSteps = 2000;
+
+class IndexDaemonTest : public testing::ShareTestRoot {
+ protected:
+  IndexDaemonTest() {
+    root_ = AddShare("s");
+    docs_ = root_ + "/docs";
+    std::filesystem::create_directories(docs_);
+    std::filesystem::create_directories(root_ + "/@eaDir/@fileindex");
+    queue_ = root_ + "/@eaDir/@fileindex/queue";
+    peer_.SetResponder([](const Json::Value& request) -> ElasticPeer::Reply {
+      // A rename lists the moved item's descendants: there are none here.
+      if (request["command"] == "document_get_by_query") return R"({"success":true,"data":[]})";
+      return std::string(ElasticPeer::kSuccess);
+    });
+    WriteFolders(/*paused=*/false);
+  }
+
+  SystemHooks FakeClock() {
+    SystemHooks hooks;
+    hooks.now = [this] { return now_; };
+    hooks.sleep_for = [this](unsigned long micros) {
+      now_ += static_cast<time_t>(micros / 1000000);
+    };
+    return hooks;
+  }
+
+  void WriteFolders(bool paused) {
+    std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
+    dir_.Write("var/packages/Orvex/etc/fileindex.folders",
+               std::string(R"([{"path": "/s/docs", "name": "docs", "document": false, )") +
+                   R"("audio": false, "video": false, "photo": false, "paused": )" +
+                   (paused ? "true" : "false") + "}]");
+  }
+
+  void WriteStatus(const std::string& text) {
+    std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
+    dir_.Write("var/packages/Orvex/etc/fileindex.status", text);
+  }
+
+  std::string Touch(const std::string& rel) {
+    const std::string path = docs_ + "/" + rel;
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+    std::ofstream(path) << "x";
+    return path;
+  }
+
+  static void Append(const std::string& file, const std::string& line) {
+    std::ofstream(file, std::ios::app) << line << "\n";
+  }
+  static std::string Line(unsigned event, const std::string& path, bool is_dir = false) {
+    return R"({"event": )" + std::to_string(event) + R"(, "is_dir": )" +
+           (is_dir ? "true" : "false") + R"(, "path": ")" + path + "\"}";
+  }
+  static std::string RenameLine(const std::string& from, const std::string& to) {
+    return R"({"event": 256, "is_dir": false, "path": ")" + to + R"(", "path_old": ")" + from +
+           "\"}";
+  }
+
+  void Start(WorkerOptions worker = Quick()) {
+    IndexDaemonOptions options;
+    options.server.socket_path = dir_.Join("var/run/fileindexd.sock");
+    options.worker = worker;
+    daemon_ = std::make_unique<IndexDaemon>(options);
+    std::string why;
+    ASSERT_TRUE(daemon_->Start(why)) << why;
+  }
+
+  static WorkerOptions Quick() {
+    WorkerOptions worker;
+    worker.quiet_s = 0;
+    return worker;
+  }
+
+  // Steps the daemon until no queue file is left: every batch is committed
+  // and its snapshot deleted.
+  void Drain() {
+    for (int i = 0; i < kMaxSteps && (Exists(queue_) || Exists(queue_ + ".tmp")); ++i) {
+      daemon_->RunOnce(0);
+    }
+    ASSERT_FALSE(Exists(queue_ + ".tmp"));
+    ASSERT_FALSE(Exists(queue_));
+  }
+
+  // Sends a command with the library's own client while the daemon steps.
+  void Command(const std::string& type, const Json::Value& data) {
+    auto sent = std::async(std::launch::async, [&] { fileindex::SendCommandToDaemon(type, data); });
+    for (int i = 0;
+         i < kMaxSteps && sent.wait_for(std::chrono::seconds(0)) != std::future_status::ready;
+         ++i) {
+      daemon_->RunOnce(10);
+    }
+    ASSERT_EQ(sent.wait_for(std::chrono::seconds(5)), std::future_status::ready);
+    sent.get();
+  }
+
+  // One framed exchange on the daemon's socket, answer returned parsed.
+  Json::Value Exchange(const std::string& body) {
+    const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    const std::string path = dir_.Join("var/run/fileindexd.sock");
+    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
+    EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+    const uint32_t length = static_cast<uint32_t>(body.size());
+    EXPECT_EQ(::write(fd, &length, sizeof(length)), 4);
+    EXPECT_EQ(::write(fd, body.data(), body.size()), static_cast<ssize_t>(body.size()));
+    std::string answer;
+    for (int i = 0; i < kMaxSteps; ++i) {
+      daemon_->RunOnce(0);
+      pollfd in{fd, POLLIN, 0};
+      if (::poll(&in, 1, 0) <= 0) continue;
+      char buf[4096];
+      const ssize_t n = ::read(fd, buf, sizeof(buf));
+      if (n <= 0) break;
+      answer.append(buf, static_cast<size_t>(n));
+      if (answer.size() >= 4) {
+        uint32_t want = 0;
+        std::memcpy(&want, answer.data(), 4);
+        if (answer.size() >= 4 + want) break;
+      }
+    }
+    ::close(fd);
+    Json::Value parsed;
+    if (answer.size() > 4) {
+      EXPECT_EQ(answer.back(), '\0');
+      EXPECT_TRUE(fromString(parsed, answer.substr(4, answer.size() - 5))) << answer;
+    }
+    return parsed;
+  }
+
+  static std::string Body(const std::string& json) { return json + std::string(1, '\0'); }
+
+  static bool Exists(const std::string& path) { return std::filesystem::exists(path); }
+
+  // The search daemon's requests, one short line each.
+  std::vector<std::string> Commands() const {
+    std::vector<std::string> out;
+    for (const Json::Value& r : peer_.requests()) {
+      const std::string command = r["command"].asString();
+      if (r.isMember("compound")) {
+        out.push_back("compound " + std::to_string(r["compound"].size()));
+      } else if (command == "document_del_by_query" || command == "document_get_by_query") {
+        out.push_back(command + " " + r["data"]["query"]["qsl"]["prefix"]["KALOMDPath"].asString());
+      } else if (command == "commit") {
+        out.push_back(command);
+      } else {
+        out.push_back(command + " " + r["data"]["doc_id"].asString());
+      }
+    }
+    return out;
+  }
+
+  time_t now_ = kStart;
+  ScopedSystemHooks hooks_{FakeClock()};
+  ElasticPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
+  testing::LogCapture log_;
+  std::string root_, docs_, queue_;
+  std::unique_ptr<IndexDaemon> daemon_;
+};
+
+TEST_F(IndexDaemonTest, QueueBecomesDocumentCommandsInOrderThenCommitAndSnapshotGoes) {
+  const std::string a = Touch("a.bin"), b = Touch("b.bin"), c = Touch("c.bin");
+  const std::string e = Touch("e.bin");
+  const std::string d = docs_ + "/d.bin", f = docs_ + "/f.bin";
+  Append(queue_, Line(64, a));
+  Append(queue_, Line(64, b));
+  Append(queue_, Line(2, c));
+  Append(queue_, RenameLine(d, e));
+  Append(queue_, Line(128, f));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{"document_upsert_by_id " + a, "document_upsert_by_id " + b,
+                                      "document_upsert_by_id " + c, "document_set_by_id " + d,
+                                      "document_get_by_query " + d + "/", "compound 0",
+                                      "document_del_by_id " + f, "commit"}));
+  EXPECT_EQ(peer_.requests()[0]["data"]["id"], "fileindex_s");
+  EXPECT_TRUE(peer_.faults().empty());
+}
+
+TEST_F(IndexDaemonTest, SnapshotOfAKilledRunIsProcessedBeforeTheLiveQueue) {
+  const std::string a = Touch("a.bin"), b = Touch("b.bin");
+  Append(queue_ + ".tmp", Line(64, a));
+  Append(queue_, Line(64, b));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit",
+                                                  "document_upsert_by_id " + b, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, ReindexWalksTheFolderAndUpsertsEveryFileAndDirectoryButNoMetadata) {
+  const std::string x = Touch("x.bin"), y = Touch("sub/y.bin");
+  Touch("@eaDir/thumb.jpg");
+  Touch("sub/@eaDir/z.jpg");
+  Touch("#recycle/old.bin");
+  Append(queue_, Line(0x10000, docs_));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{
+                "document_get_by_query " + docs_ + "/", "document_upsert_by_id " + docs_,
+                "document_upsert_by_id " + docs_ + "/sub", "document_upsert_by_id " + y,
+                "document_upsert_by_id " + x, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, ReindexReadsOnlyChangedFilesAndDeletesDocumentsOfVanishedOnes) {
+  const std::string same = Touch("same.bin"), changed = Touch("changed.bin");
+  const std::string gone = docs_ + "/gone.bin";
+  struct stat st;
+  ASSERT_EQ(::lstat(same.c_str(), &st), 0);
+  Json::Value known(Json::arrayValue);
+  const auto add = [&](const std::string& path, long long size) {
+    Json::Value doc;
+    doc["KALOMDPath"] = path;
+    doc["KALOMDFSSize"] = static_cast<Json::Int64>(size);
+    doc["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
+    doc["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
+    known.append(doc);
+  };
+  add(changed, st.st_size + 1);  // the file grew since it was indexed
+  add(gone, 1);
+  add(same, st.st_size);
+  Json::Value answer;
+  answer["success"] = true;
+  answer["data"] = known;
+  const std::string text = toString(answer);
+  peer_.SetResponder([text](const Json::Value& request) -> ElasticPeer::Reply {
+    if (request["command"] == "document_get_by_query") return text;
+    return std::string(ElasticPeer::kSuccess);
+  });
+  Append(queue_, Line(0x10000, docs_));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{
+                "document_get_by_query " + docs_ + "/", "document_upsert_by_id " + docs_,
+                "document_upsert_by_id " + changed, "document_del_by_id " + gone, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, ConfigurationChangeReadsEveryFileAgain) {
+  const std::string a = Touch("a.bin");
+  struct stat st;
+  ASSERT_EQ(::lstat(a.c_str(), &st), 0);
+  Json::Value answer;
+  answer["success"] = true;
+  answer["data"][0]["KALOMDPath"] = a;
+  answer["data"][0]["KALOMDFSSize"] = static_cast<Json::Int64>(st.st_size);
+  answer["data"][0]["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
+  answer["data"][0]["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
+  const std::string text = toString(answer);
+  peer_.SetResponder([text](const Json::Value& request) -> ElasticPeer::Reply {
+    if (request["command"] == "document_get_by_query") return text;
+    return std::string(ElasticPeer::kSuccess);
+  });
+  Append(queue_, R"({"event": 131072, "path": ")" + docs_ + R"(", "data": {"document": true}})");
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + docs_ + "/",
+                                                  "document_upsert_by_id " + docs_,
+                                                  "document_upsert_by_id " + a, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, QueueIsTakenWhenQuietOrAfterTheLongestWaitOfASteadyStream) {
+  WorkerOptions worker;
+  worker.quiet_s = 5;
+  worker.max_wait_s = 30;
+  Start(worker);
+  const std::string a = Touch("a.bin");
+  Append(queue_, Line(2, a));
+  daemon_->RunOnce(0);
+  now_ += 4;
+  daemon_->RunOnce(0);
+  EXPECT_TRUE(peer_.requests().empty());  // not yet quiet for long enough
+  now_ += 1;
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+
+  // A line every few seconds: never quiet, yet taken once the first has waited 30 s.
+  for (int second = 0; second < 30; second += 3) {
+    Append(queue_, Line(2, a));
+    daemon_->RunOnce(0);
+    EXPECT_EQ(peer_.requests().size(), 2u) << "taken early, at second " << second;
+    now_ += 3;
+  }
+  Append(queue_, Line(2, a));
+  Drain();
+  EXPECT_EQ(peer_.requests().size(), 4u);
+}
+
+TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
+  const std::string a = Touch("a.bin"), b = Touch("b.bin");
+  Append(queue_, Line(64, a));
+  Append(queue_, Line(64, b));
+  peer_.Stop();
+  Start();
+  for (int i = 0; i < 20; ++i) daemon_->RunOnce(0);
+  EXPECT_TRUE(Exists(queue_ + ".tmp"));
+  EXPECT_EQ(daemon_->Status()["shares"]["s"]["state"], "retrying");
+  EXPECT_EQ(daemon_->Status()["shares"]["s"]["todo"], 2);
+  ElasticPeer back(dir_.Join("var/run/kaloelasticd.sock"));
+  now_ += 30;
+  Drain();
+  EXPECT_EQ(back.requests().size(), 3u);
+  EXPECT_EQ(back.requests()[0]["data"]["doc_id"], a);
+  EXPECT_EQ(back.requests()[2]["command"], "commit");
+}
+
+TEST_F(IndexDaemonTest, CrashMarkWalksEveryIndexedFolderOfTheShareInstead) {
+  const std::string a = Touch("a.bin");
+  Append(queue_, Line(64, a));
+  Append(queue_, Line(0x200, root_));
+  Append(queue_, Line(128, docs_ + "/never-looked-at.bin"));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{
+                "document_get_by_query " + root_ + "/", "document_get_by_query " + docs_ + "/",
+                "document_upsert_by_id " + docs_, "document_upsert_by_id " + a, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, EventsInMetadataFoldersNeverBecomeDocuments) {
+  const std::string thumb = Touch("@eaDir/t.jpg");
+  const std::string kept = Touch("k.bin");
+  Append(queue_, Line(64, thumb));
+  Append(queue_, Line(64, kept));
+  Start();
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + kept, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, NothingIsSentWhilePausedUntilTheResumeTimeComes) {
+  WriteStatus(R"({"resume_time": )" + std::to_string(kStart + 3600) + "}");
+  const std::string a = Touch("a.bin");
+  Append(queue_, Line(64, a));
+  Start();
+  for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
+  EXPECT_TRUE(peer_.requests().empty());
+  EXPECT_TRUE(Exists(queue_));
+  EXPECT_EQ(daemon_->Status()["paused"], true);
+  now_ = kStart + 3600;
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+  EXPECT_EQ(daemon_->Status()["paused"], false);
+}
+
+TEST_F(IndexDaemonTest, PauseAndResumeCommandsHoldAndReleaseTheWorkers) {
+  Start();
+  Json::Value pause;
+  pause["resume_time"] = 0;
+  Command("pause", pause);
+  const std::string a = Touch("a.bin");
+  Append(queue_, Line(64, a));
+  for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
+  EXPECT_TRUE(peer_.requests().empty());
+  Command("resume", Json::nullValue);
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+}
+
+TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
+  WriteFolders(/*paused=*/true);  // a paused share has no worker at start
+  Start();
+  EXPECT_FALSE(daemon_->HasWorker("s"));
+  Json::Value share;
+  share["share_name"] = "s";
+  Command("worker_create", share);
+  EXPECT_TRUE(daemon_->HasWorker("s"));
+  const std::string a = Touch("a.bin");
+  Append(queue_, Line(64, a));
+  Drain();
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+
+  Command("worker_delete", share);
+  EXPECT_FALSE(daemon_->HasWorker("s"));
+  Append(queue_, Line(64, a));
+  for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
+  EXPECT_EQ(peer_.requests().size(), 2u);
+  EXPECT_TRUE(Exists(queue_));
+}
+
+TEST_F(IndexDaemonTest, SettingChangeStartsAWorkerForANewlyIndexedShare) {
+  WriteFolders(/*paused=*/true);
+  Start();
+  Json::Value change;
+  change["share_name"] = "s";
+  change["is_upsert"] = true;
+  Command("notify_setting_changed", change);
+  EXPECT_TRUE(daemon_->HasWorker("s"));
+  change["is_upsert"] = false;  // the share still has its folder: it keeps its worker
+  Command("notify_setting_changed", change);
+  EXPECT_TRUE(daemon_->HasWorker("s"));
+  dir_.Write("var/packages/Orvex/etc/fileindex.folders", "[]");
+  Command("notify_setting_changed", change);
+  EXPECT_FALSE(daemon_->HasWorker("s"));
+}
+
+TEST_F(IndexDaemonTest, StatusAnswersPerShareProgressAndPauseState) {
+  Start();
+  const Json::Value answer = Exchange(Body(R"({"type": "status", "data": null})"));
+  ASSERT_EQ(answer["success"], true) << toString(answer);
+  EXPECT_EQ(answer["data"]["paused"], false);
+  const Json::Value& share = answer["data"]["shares"]["s"];
+  EXPECT_EQ(share["state"], "idle");
+  EXPECT_EQ(share["done"], 0);
+  EXPECT_EQ(share["todo"], 0);
+  EXPECT_TRUE(share.isMember("rate"));
+  EXPECT_TRUE(share.isMember("eta"));
+}
+
+TEST_F(IndexDaemonTest, BadFramesAreRefusedAndTheSocketIsGroupOnly) {
+  Start();
+  struct stat st;
+  ASSERT_EQ(::stat(dir_.Join("var/run/fileindexd.sock").c_str(), &st), 0);
+  EXPECT_EQ(st.st_mode & 0777, 0660u);
+  EXPECT_EQ(Exchange(R"({"type": "status"})")["error"]["msg"], "request without its NUL");
+  EXPECT_EQ(Exchange(Body(R"({"type": "dance"})"))["error"]["code"], 120);
+  EXPECT_EQ(Exchange(Body("not json"))["success"], false);
+}
+
+TEST_F(IndexDaemonTest, OversizedFramesAndConnectionsPastTheCapAreRefused) {
+  Start();
+  std::string huge(70 * 1024, 'x');
+  huge.back() = '\0';
+  EXPECT_EQ(Exchange(huge)["error"]["msg"], "bad frame length");
+
+  std::vector<int> held;
+  for (int i = 0; i < 17; ++i) {
+    const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    const std::string path = dir_.Join("var/run/fileindexd.sock");
+    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
+    ASSERT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+    held.push_back(fd);
+    daemon_->RunOnce(0);
+  }
+  // The seventeenth is closed at once: it reads the end of the stream.
+  pollfd last{held.back(), POLLIN, 0};
+  ASSERT_EQ(::poll(&last, 1, 5000), 1);
+  char byte = 0;
+  EXPECT_EQ(::read(held.back(), &byte, 1), 0);
+  pollfd first{held.front(), POLLIN, 0};
+  EXPECT_EQ(::poll(&first, 1, 0), 0);  // the others stay open
+  for (const int fd : held) ::close(fd);
+}
+
+TEST_F(IndexDaemonTest, NeedReindexFlagAtStartWalksTheShareAndIsCleared) {
+  WriteStatus(R"({"share": {"s": 1}})");
+  const std::string x = Touch("x.bin");
+  Start();
+  for (int i = 0; i < kMaxSteps && (Commands().empty() || Commands().back() != "commit"); ++i) {
+    daemon_->RunOnce(0);
+  }
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{
+                "document_get_by_query " + root_ + "/", "document_get_by_query " + docs_ + "/",
+                "document_upsert_by_id " + docs_, "document_upsert_by_id " + x, "commit"}));
+  Json::Value status;
+  ASSERT_TRUE(fromFile(status, dir_.Join("var/packages/Orvex/etc/fileindex.status")));
+  EXPECT_EQ(status["share"]["s"], 0);
+}
+
+}  // namespace
+}  // namespace indexd
+}  // namespace orvex
