@@ -65,6 +65,9 @@ int RunExtractCommand(const Args& args);  // extract_commands.cc
 int RunWatchCommand(const Args& args);    // watch_commands.cc
 int RunSearchCommand(const Args& args);   // search_commands.cc
 int RunStatsCommand(const Args& args);    // search_commands.cc
+int RunUpCommand(const Args& args);       // system_commands.cc
+int RunDownCommand(const Args& args);     // system_commands.cc
+int RunIndexCommand(const Args& args);    // system_commands.cc
 
 // The management commands (manage_commands.cc): two groups of their own and
 // the changing subcommands of the folder and share groups.

@@ -2,12 +2,18 @@
 // the share registry, shows the index status, and pauses or resumes indexing
 // (telling the indexing daemon at once). Fixed paths follow ORVEX_ROOT like
 // everything else in the system.
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
 #include <iostream>
 #include <new>
 #include <string>
 
 #include "command_line.h"
 #include "orvex/foundation/error.h"
+#include "orvex/portable/atomic_file.h"
 #include "orvex/version.h"
 #include "terminal_text.h"
 
@@ -24,6 +30,9 @@ namespace {
 //   3. add one line {"folder", "<one-line summary>", RunFolderCommand} below.
 // The build picks the new file up by itself.
 const CommandGroup kCommands[] = {
+    {"up", "start the search, extraction, watcher and indexing daemons", RunUpCommand},
+    {"down", "stop the daemons that up started", RunDownCommand},
+    {"index", "make a directory searchable and wait until it is", RunIndexCommand},
     {"share", "manage the share registry and pause, resume or forget shares", RunShareCommand},
     {"status", "show whether indexing is paused and each share's status", RunStatusCommand},
     {"pause", "pause indexing for HOURS hours, or with no end", RunPauseCommand},
@@ -49,8 +58,9 @@ std::string Usage() {
   }
   usage +=
       "Options: --help (also after any command), --version.\n"
-      "Fixed paths (share registry, status file, daemon socket) are taken under\n"
-      "$ORVEX_ROOT when it is set.\n"
+      "Fixed paths (share registry, status file, daemon sockets) are taken under\n"
+      "$ORVEX_ROOT when it is set; for a user other than root it defaults to\n"
+      "~/.orvex, a private root, so the whole system runs without privileges.\n"
       "Exit status: 0 on success, 2 on any failure or bad usage, which is reported\n"
       "as \"orvex: error CODE: REASON\" (code 120 for bad usage, followed by the usage).\n";
   return usage;
@@ -85,11 +95,31 @@ void PrintError(int code, const std::string& reason) {
   std::cerr << "orvex: error " << code << ": " << reason << "\n";
 }
 
+// A user other than root cannot write the system's fixed paths: unless
+// ORVEX_ROOT says where, such a user's whole system lives in ~/.orvex, for
+// this command and the daemons it starts.
+void UsePrivateRootUnlessRoot() {
+  const char* root = std::getenv("ORVEX_ROOT");
+  if ((root != nullptr && root[0] != '\0') || ::geteuid() == 0) return;
+  const char* home = std::getenv("HOME");
+  if (home == nullptr || home[0] != '/') {
+    throw orvex::Error(orvex::kErrorBadArgument,
+                       "set ORVEX_ROOT to a directory of yours: HOME is not set");
+  }
+  const std::string private_root = std::string(home) + "/.orvex";
+  if (!orvex::portable::MakeDirectories(private_root)) {
+    throw orvex::Error(orvex::kErrorSystem,
+                       "cannot make " + private_root + ": " + std::strerror(errno));
+  }
+  ::setenv("ORVEX_ROOT", private_root.c_str(), /*overwrite=*/1);
+}
+
 // Exceptions stop here: each becomes one "orvex: error CODE: REASON" line on
 // standard error. The commands put what, where, why and what to do into the
 // reasons; what reaches this far unexplained is at least named.
 int Main(const Args& args) {
   try {
+    UsePrivateRootUnlessRoot();
     return Dispatch(args);
   } catch (const UsageError& e) {
     PrintError(orvex::kErrorBadArgument, e.what());

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "command_line.h"
+#include "daemon_client.h"
 #include "kalo/kalo_sock.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
@@ -39,28 +40,8 @@ constexpr char kStatsUsage[] =
     "Prints each search index: its id, documents, size on disk, whether it is paused\n"
     "and whether it holds uncommitted changes.\n";
 
-// One request to the daemon; its "data" on success. Throws with the daemon's
-// reason or with what to do when it does not answer.
-Json::Value AskDaemon(const Json::Value& request) {
-  const std::string socket = orvex::portable::RootPath(kSearchSocketPath);
-  kalodaemon::DomainSockConnection connection(socket);
-  std::string text;
-  if (!connection.Connect() || !connection.Send(orvex::toString(request)) ||
-      !connection.Recv(text)) {
-    throw orvex::Error(orvex::kErrorSearchDaemon, "the search daemon does not answer on " + socket +
-                                                      ": " + std::strerror(errno) +
-                                                      "; start kaloelasticd");
-  }
-  Json::Value answer;
-  if (!orvex::fromString(answer, text) || !answer.isObject() || !answer["success"].isBool()) {
-    throw orvex::Error(orvex::kErrorSearchDaemon, "the search daemon gave a bad answer: " + text);
-  }
-  if (!answer["success"].asBool()) {
-    // The daemon's own code and reason (doc/search_protocol.md).
-    throw orvex::Error(static_cast<orvex::ErrorCode>(answer["error"]["code"].asInt()),
-                       answer["error"]["msg"].asString());
-  }
-  return answer["data"];
+Json::Value AskSearchDaemon(const Json::Value& request) {
+  return AskDaemon(kSearchSocketPath, "the search daemon kaloelasticd", request);
 }
 
 int Number(const std::string& option, const std::string& text) {
@@ -127,7 +108,7 @@ int RunSearchCommand(const Args& args) {
   Json::Value request;
   request["command"] = "search";
   request["data"] = ParseSearch(args, json);
-  const Json::Value data = AskDaemon(request);
+  const Json::Value data = AskSearchDaemon(request);
   if (json) {
     std::cout << orvex::toString(data) << "\n";
     return kExitOk;
@@ -150,7 +131,7 @@ int RunStatsCommand(const Args& args) {
   Json::Value request;
   request["command"] = "stats";
   request["data"] = Json::Value(Json::objectValue);
-  const Json::Value data = AskDaemon(request);
+  const Json::Value data = AskSearchDaemon(request);
   if (parsed.Has("--json")) {
     std::cout << orvex::toString(data) << "\n";
     return kExitOk;

@@ -1,0 +1,105 @@
+// The whole road with the real programs in a temporary root: orvex up starts
+// the four daemons, orvex index makes a directory searchable, a file written
+// afterwards becomes searchable through the watcher and the indexing daemon,
+// and orvex down stops everything. Waits are on the system's own answers.
+#include <gtest/gtest.h>
+#include <signal.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <thread>
+
+#include "programs/program_test.h"
+
+namespace orvex {
+namespace testing {
+namespace {
+
+constexpr auto kPatience = std::chrono::seconds(60);
+
+class WholeSystemTest : public ProgramTest {
+ protected:
+  WholeSystemTest() : ProgramTest("orvex") {}
+
+  void TearDown() override {
+    // Never leave daemons behind, whatever the test did.
+    Run({"down"});
+  }
+
+  // The output of `orvex search ARGS`, once it contains wanted (or the last
+  // output after a minute): the index follows the disk within moments.
+  std::string SearchUntil(const std::vector<std::string>& args, const std::string& wanted) {
+    std::vector<std::string> command = {"search"};
+    command.insert(command.end(), args.begin(), args.end());
+    const auto give_up = std::chrono::steady_clock::now() + kPatience;
+    for (;;) {
+      const ProgramOutcome outcome = Run(command);
+      if (outcome.out.find(wanted) != std::string::npos ||
+          std::chrono::steady_clock::now() >= give_up) {
+        return outcome.out + outcome.err;
+      }
+      std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+  }
+
+  std::string MakeTree() {
+    const std::string dir = io_.Join("library");
+    std::filesystem::create_directories(dir + "/notes/@eaDir");
+    std::ofstream(dir + "/notes/Straße.txt") << "a walk along the riverside promenade\n";
+    std::ofstream(dir + "/notes/@eaDir/hidden.txt") << "metadata, never a document\n";
+    std::ofstream(dir + "/readme.md") << "# Library\nnothing about rivers here\n";
+    return dir;
+  }
+};
+
+TEST_F(WholeSystemTest, IndexedDirectoryIsSearchableByNameAndTextAndFollowsChanges) {
+  const ProgramOutcome up = Run({"up"});
+  ASSERT_EQ(0, up.status) << up.out << up.err;
+  for (const char* daemon : {"kaloelasticd", "kalocontentextractd", "kalonotifyd", "fileindexd"}) {
+    EXPECT_NE(std::string::npos, up.out.find(std::string(daemon) + ": started")) << up.out;
+  }
+  EXPECT_NE(std::string::npos, Run({"up"}).out.find("fileindexd: already running"));
+
+  const std::string dir = MakeTree();
+  const ProgramOutcome index = Run({"index", dir, "--timeout", "60"});
+  ASSERT_EQ(0, index.status) << index.out << index.err;
+  EXPECT_NE(std::string::npos, index.out.find("registered share library at " + dir)) << index.out;
+  EXPECT_NE(std::string::npos, index.out.find("is searchable")) << index.out;
+
+  // Full case folding: "STRASSE" finds "Straße".
+  const std::string by_name = Run({"search", "STRASSE"}).out;
+  EXPECT_NE(std::string::npos, by_name.find(dir + "/notes/Straße.txt")) << by_name;
+  const std::string by_text = Run({"search", "--text", "riverside"}).out;
+  EXPECT_NE(std::string::npos, by_text.find("Straße.txt")) << by_text;
+  EXPECT_EQ(std::string::npos, by_text.find("readme.md")) << by_text;
+  EXPECT_EQ(std::string::npos, Run({"search", "hidden"}).out.find("hidden.txt"));
+
+  // A change after the first index reaches the search through the watcher.
+  std::ofstream(dir + "/notes/zebra-crossing.txt") << "stripes\n";
+  EXPECT_NE(std::string::npos,
+            SearchUntil({"zebra"}, "zebra-crossing.txt").find(dir + "/notes/zebra-crossing.txt"));
+  std::filesystem::remove(dir + "/readme.md");
+  EXPECT_NE(std::string::npos, SearchUntil({"readme"}, "0 of 0 hits").find("0 of 0 hits"));
+
+  const ProgramOutcome down = Run({"down"});
+  EXPECT_EQ(0, down.status) << down.err;
+  EXPECT_NE(std::string::npos, down.out.find("kaloelasticd: stopped")) << down.out;
+  const ProgramOutcome after = Run({"search", "zebra"});
+  EXPECT_EQ(2, after.status);
+  EXPECT_NE(std::string::npos, after.err.find("start the daemons: orvex up")) << after.err;
+}
+
+TEST_F(WholeSystemTest, IndexWithoutDaemonsSaysToStartThemAndChangesNothing) {
+  const std::string dir = MakeTree();
+  const ProgramOutcome index = Run({"index", dir});
+  EXPECT_EQ(2, index.status);
+  EXPECT_NE(std::string::npos, index.err.find("fileindexd does not answer")) << index.err;
+  EXPECT_NE(std::string::npos, index.err.find("orvex up")) << index.err;
+  EXPECT_FALSE(std::filesystem::exists(root_.Join("etc/orvex/shares.json")));
+}
+
+}  // namespace
+}  // namespace testing
+}  // namespace orvex
