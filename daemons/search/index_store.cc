@@ -9,6 +9,7 @@
 #include "orvex/foundation/json.h"
 #include "orvex/policy/file_type.h"
 #include "search/case_fold.h"
+#include "search/json_text.h"
 #include "search/search_error.h"
 
 namespace orvex {
@@ -21,7 +22,22 @@ constexpr int64_t kJournalSizeLimit = 64 << 20;
 
 // The schema. Text content lives in its own table, apart from the properties
 // that every listing reads. Both full-text tables are external-content
-// tables kept in step by triggers: the text is stored once.
+// tables: the text is stored once.
+//
+// A row enters its full-text table at commit, not when it is written: the
+// triggers only note its id in unindexed_names / unindexed_words, and
+// Commit() indexes the noted rows in one statement each. FTS5 writes a new
+// segment whenever a savepoint opens on a table it has touched, and every
+// command runs in its own savepoint: indexing row by row would write (and
+// later merge) one segment per document. A row is in its full-text table
+// exactly when it is not noted; a row removed or renamed before being
+// indexed is simply no longer noted. The notes are empty between commits,
+// and a rolled-back transaction takes its notes with it.
+//
+// Only the columns that searches filter or sort on are indexed: every other
+// index would be written on each insert and never read. (The owner filter
+// is not one: no command sets it, and where it is used it narrows a name or
+// word match that is already small.)
 constexpr char kSchema[] = R"sql(
 CREATE TABLE IF NOT EXISTS meta(key TEXT PRIMARY KEY, value TEXT NOT NULL);
 CREATE TABLE IF NOT EXISTS documents(
@@ -36,41 +52,60 @@ CREATE TABLE IF NOT EXISTS documents(
   size INTEGER, mtime INTEGER, ctime INTEGER, crtime INTEGER,
   owner TEXT NOT NULL,
   body TEXT NOT NULL);
-CREATE INDEX IF NOT EXISTS documents_parent ON documents(parent);
+DROP INDEX IF EXISTS documents_parent;
+DROP INDEX IF EXISTS documents_ctime;
+DROP INDEX IF EXISTS documents_crtime;
+DROP INDEX IF EXISTS documents_owner;
 CREATE INDEX IF NOT EXISTS documents_type ON documents(type);
 CREATE INDEX IF NOT EXISTS documents_extension ON documents(extension);
 CREATE INDEX IF NOT EXISTS documents_size ON documents(size);
 CREATE INDEX IF NOT EXISTS documents_mtime ON documents(mtime);
-CREATE INDEX IF NOT EXISTS documents_ctime ON documents(ctime);
-CREATE INDEX IF NOT EXISTS documents_crtime ON documents(crtime);
-CREATE INDEX IF NOT EXISTS documents_owner ON documents(owner);
 CREATE INDEX IF NOT EXISTS documents_folded_name ON documents(folded_name, path);
 CREATE TABLE IF NOT EXISTS contents(id INTEGER PRIMARY KEY, text TEXT NOT NULL, props TEXT NOT NULL);
+CREATE TABLE IF NOT EXISTS unindexed_names(id INTEGER PRIMARY KEY);
+CREATE TABLE IF NOT EXISTS unindexed_words(id INTEGER PRIMARY KEY);
 CREATE VIRTUAL TABLE IF NOT EXISTS name_grams USING fts5(
   folded_name, content='documents', content_rowid='id', tokenize='trigram case_sensitive 1');
 CREATE VIRTUAL TABLE IF NOT EXISTS words USING fts5(
   text, props, content='contents', content_rowid='id',
   tokenize='unicode61 remove_diacritics 2');
-CREATE TRIGGER IF NOT EXISTS documents_ai AFTER INSERT ON documents BEGIN
-  INSERT INTO name_grams(rowid, folded_name) VALUES (new.id, new.folded_name);
+DROP TRIGGER IF EXISTS documents_ai;
+DROP TRIGGER IF EXISTS documents_ad;
+DROP TRIGGER IF EXISTS documents_au;
+DROP TRIGGER IF EXISTS contents_ai;
+DROP TRIGGER IF EXISTS contents_ad;
+DROP TRIGGER IF EXISTS contents_au;
+CREATE TRIGGER IF NOT EXISTS documents_added AFTER INSERT ON documents BEGIN
+  INSERT INTO unindexed_names(id) VALUES (new.id);
 END;
-CREATE TRIGGER IF NOT EXISTS documents_ad AFTER DELETE ON documents BEGIN
-  INSERT INTO name_grams(name_grams, rowid, folded_name) VALUES ('delete', old.id, old.folded_name);
+CREATE TRIGGER IF NOT EXISTS documents_removed AFTER DELETE ON documents BEGIN
+  INSERT INTO name_grams(name_grams, rowid, folded_name)
+    SELECT 'delete', old.id, old.folded_name
+    WHERE NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
+  DELETE FROM unindexed_names WHERE id = old.id;
   DELETE FROM contents WHERE id = old.id;
 END;
-CREATE TRIGGER IF NOT EXISTS documents_au AFTER UPDATE OF folded_name ON documents BEGIN
-  INSERT INTO name_grams(name_grams, rowid, folded_name) VALUES ('delete', old.id, old.folded_name);
-  INSERT INTO name_grams(rowid, folded_name) VALUES (new.id, new.folded_name);
+CREATE TRIGGER IF NOT EXISTS documents_renamed AFTER UPDATE OF folded_name ON documents
+WHEN old.folded_name IS NOT new.folded_name BEGIN
+  INSERT INTO name_grams(name_grams, rowid, folded_name)
+    SELECT 'delete', old.id, old.folded_name
+    WHERE NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
+  INSERT OR IGNORE INTO unindexed_names(id) VALUES (new.id);
 END;
-CREATE TRIGGER IF NOT EXISTS contents_ai AFTER INSERT ON contents BEGIN
-  INSERT INTO words(rowid, text, props) VALUES (new.id, new.text, new.props);
+CREATE TRIGGER IF NOT EXISTS contents_added AFTER INSERT ON contents BEGIN
+  INSERT INTO unindexed_words(id) VALUES (new.id);
 END;
-CREATE TRIGGER IF NOT EXISTS contents_ad AFTER DELETE ON contents BEGIN
-  INSERT INTO words(words, rowid, text, props) VALUES ('delete', old.id, old.text, old.props);
+CREATE TRIGGER IF NOT EXISTS contents_removed AFTER DELETE ON contents BEGIN
+  INSERT INTO words(words, rowid, text, props)
+    SELECT 'delete', old.id, old.text, old.props
+    WHERE NOT EXISTS (SELECT 1 FROM unindexed_words WHERE id = old.id);
+  DELETE FROM unindexed_words WHERE id = old.id;
 END;
-CREATE TRIGGER IF NOT EXISTS contents_au AFTER UPDATE ON contents BEGIN
-  INSERT INTO words(words, rowid, text, props) VALUES ('delete', old.id, old.text, old.props);
-  INSERT INTO words(rowid, text, props) VALUES (new.id, new.text, new.props);
+CREATE TRIGGER IF NOT EXISTS contents_changed AFTER UPDATE ON contents BEGIN
+  INSERT INTO words(words, rowid, text, props)
+    SELECT 'delete', old.id, old.text, old.props
+    WHERE NOT EXISTS (SELECT 1 FROM unindexed_words WHERE id = old.id);
+  INSERT OR IGNORE INTO unindexed_words(id) VALUES (new.id);
 END;
 )sql";
 
@@ -154,6 +189,15 @@ void ExecPragmas(SqliteDb& db) {
   db.Exec("PRAGMA synchronous=NORMAL");
   db.Exec("PRAGMA journal_size_limit=" + std::to_string(kJournalSizeLimit));
   db.Exec("PRAGMA busy_timeout=5000");
+  // The page cache holds the pages a transaction of 10,000 documents
+  // dirties (at the default 2 MB they spill into the log before the commit
+  // and are written twice), and the indexes' upper levels between commits.
+  // A negative size is in KiB: 64 MiB at most, taken only as used.
+  db.Exec("PRAGMA cache_size=-65536");
+  // Each command's savepoint keeps the pages it first changes in a
+  // statement journal so that a failed command can be undone; in memory it
+  // costs a copy, in a temporary file a write.
+  db.Exec("PRAGMA temp_store=MEMORY");
 }
 
 }  // namespace
@@ -194,10 +238,19 @@ struct IndexStore::Statements {
         savepoint(w, "SAVEPOINT command"),
         release(w, "RELEASE command"),
         rollback_to(w, "ROLLBACK TO command"),
+        index_names(w,
+                    "INSERT INTO name_grams(rowid, folded_name) SELECT d.id, d.folded_name "
+                    "FROM unindexed_names u JOIN documents d ON d.id = u.id ORDER BY u.id"),
+        forget_names(w, "DELETE FROM unindexed_names"),
+        index_words(w,
+                    "INSERT INTO words(rowid, text, props) SELECT c.id, c.text, c.props "
+                    "FROM unindexed_words u JOIN contents c ON c.id = u.id ORDER BY u.id"),
+        forget_words(w, "DELETE FROM unindexed_words"),
         commit(w, "COMMIT"),
         rollback(w, "ROLLBACK") {}
   Statement find, load, insert, update, insert_content, update_content, remove, remove_prefix,
-      get_prefix, begin, savepoint, release, rollback_to, commit, rollback;
+      get_prefix, begin, savepoint, release, rollback_to, index_names, forget_names, index_words,
+      forget_words, commit, rollback;
 };
 
 IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
@@ -270,7 +323,14 @@ void IndexStore::Begin() {
 }
 
 void IndexStore::Commit() {
-  if (InTransaction()) st_->commit.Run();
+  if (!InTransaction()) return;
+  // The rows written since the last commit enter the full-text tables in
+  // rowid order, in one pass each.
+  st_->index_names.Run();
+  st_->forget_names.Run();
+  st_->index_words.Run();
+  st_->forget_words.Run();
+  st_->commit.Run();
 }
 
 void IndexStore::Rollback() {
@@ -295,11 +355,13 @@ auto IndexStore::Atomically(Change change) {
 }
 
 void IndexStore::CheckTypes(const Json::Value& doc) const {
-  for (const std::string& name : doc.getMemberNames()) {
-    const auto it = types_.find(name);
-    if (it != types_.end() && !TypeMatches(it->second, doc[name])) {
-      throw SearchError(kBadArgument, "property " + name + " must be of type " + it->second +
-                                          ", not " + toString(doc[name]));
+  for (auto member = doc.begin(); member != doc.end(); ++member) {
+    const char* end = nullptr;
+    const char* name = member.memberName(&end);
+    const auto it = types_.find(std::string_view(name, static_cast<size_t>(end - name)));
+    if (it != types_.end() && !TypeMatches(it->second, *member)) {
+      throw SearchError(kBadArgument, "property " + member.name() + " must be of type " +
+                                          it->second + ", not " + toString(*member));
     }
   }
   if (doc.isMember("KALOMDPath") && !doc["KALOMDPath"].isString()) {
@@ -316,39 +378,44 @@ std::optional<int64_t> IndexStore::FindId(const std::string& path) {
   return id;
 }
 
-IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, Json::Value doc) const {
-  // Reads go through a const reference: a missing member must not be added
-  // to the stored document as null.
-  const Json::Value& view = doc;
+IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value& doc) const {
   Row row;
-  row.path = view["KALOMDPath"].isString() ? view["KALOMDPath"].asString() : doc_id;
-  doc["KALOMDPath"] = row.path;
+  row.path = doc["KALOMDPath"].isString() ? doc["KALOMDPath"].asString() : doc_id;
   const size_t slash = row.path.rfind('/');
-  row.name = StringMember(view, "KALOMDFSName");
+  row.name = StringMember(doc, "KALOMDFSName");
   if (row.name.empty())
     row.name = slash == std::string::npos ? row.path : row.path.substr(slash + 1);
-  row.parent = StringMember(view, "KALOMDParent");
+  row.parent = StringMember(doc, "KALOMDParent");
   if (row.parent.empty() && slash != std::string::npos) row.parent = row.path.substr(0, slash);
-  std::string search_name = StringMember(view, "KALOMDSearchFileName");
+  std::string search_name = StringMember(doc, "KALOMDSearchFileName");
   if (search_name.empty()) search_name = row.name;
   row.folded_name = FoldCase(search_name);
-  row.extension = view["KALOMDExtension"].isString()
-                      ? LowerAscii(view["KALOMDExtension"].asString())
-                      : ExtensionOf(row.name);
-  row.is_dir = view["KALOMDIsDir"].isBool() && view["KALOMDIsDir"].asBool();
+  row.extension = doc["KALOMDExtension"].isString() ? LowerAscii(doc["KALOMDExtension"].asString())
+                                                    : ExtensionOf(row.name);
+  row.is_dir = doc["KALOMDIsDir"].isBool() && doc["KALOMDIsDir"].asBool();
   row.type = TypeName(row.is_dir, row.extension);
-  row.size = IntMember(view, "KALOMDFSSize");
-  row.mtime = IntMember(view, "KALOMDFSContentChangeDate");
-  row.ctime = IntMember(view, "KALOMDAttributeChangeDate");
-  row.crtime = IntMember(view, "KALOMDFSCreationDate");
-  const Json::Value& owner = view["KALOMDOwnerUserID"];
+  row.size = IntMember(doc, "KALOMDFSSize");
+  row.mtime = IntMember(doc, "KALOMDFSContentChangeDate");
+  row.ctime = IntMember(doc, "KALOMDAttributeChangeDate");
+  row.crtime = IntMember(doc, "KALOMDFSCreationDate");
+  const Json::Value& owner = doc["KALOMDOwnerUserID"];
   row.owner = owner.isString()     ? owner.asString()
               : owner.isIntegral() ? std::to_string(owner.asInt64())
                                    : std::string();
-  row.text = StringMember(view, "KALOMDTextContent");
-  doc.removeMember("KALOMDTextContent");
-  for (const std::string& name : text_properties_) AppendText(view[name], row.props);
-  row.body = toString(doc);
+  row.text = StringMember(doc, "KALOMDTextContent");
+  for (const std::string& name : text_properties_) AppendText(doc[name], row.props);
+  // The body is the document with its path and without its text content.
+  // The indexer's documents of names and attributes already are: they are
+  // written out as they are, without a copy.
+  const Json::Value* path = doc.find("KALOMDPath", "KALOMDPath" + 10);
+  if (path != nullptr && path->isString() && !doc.isMember("KALOMDTextContent")) {
+    row.body = JsonText(doc);
+  } else {
+    Json::Value body = doc;
+    body["KALOMDPath"] = row.path;
+    body.removeMember("KALOMDTextContent");
+    row.body = JsonText(body);
+  }
   return row;
 }
 
@@ -399,11 +466,24 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc) {
   CheckTypes(doc);
   const Row row = MakeRow(doc_id, doc);
   Atomically([&] {
-    if (const auto id = FindId(doc_id)) st_->remove.Bind(1, *id).Run();
+    // A document sent again keeps its row, and its full-text entries when
+    // its name and words did not change: re-indexing a share rewrites no
+    // full-text index. A document moved onto the path of another replaces it.
+    std::optional<int64_t> id = FindId(doc_id);
     if (row.path != doc_id) {
-      if (const auto id = FindId(row.path)) st_->remove.Bind(1, *id).Run();
+      if (const auto other = FindId(row.path)) {
+        if (id) {
+          st_->remove.Bind(1, *other).Run();
+        } else {
+          id = other;
+        }
+      }
     }
-    Insert(row);
+    if (id) {
+      Update(*id, row);
+    } else {
+      Insert(row);
+    }
     return true;
   });
 }

@@ -9,10 +9,12 @@
 #include <json/json.h>
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "search/sqlite_db.h"
@@ -112,7 +114,7 @@ class IndexStore {
   auto Atomically(Change change);
   void CheckTypes(const Json::Value& doc) const;
   std::optional<int64_t> FindId(const std::string& path);
-  Row MakeRow(const std::string& doc_id, Json::Value doc) const;
+  Row MakeRow(const std::string& doc_id, const Json::Value& doc) const;
   void Insert(const Row& row);
   void Update(int64_t id, const Row& row);
   void LoadMappings();
@@ -121,8 +123,8 @@ class IndexStore {
   std::unique_ptr<SqliteDb> writer_;
   std::unique_ptr<SqliteDb> reader_;
   std::unique_ptr<Statements> st_;
-  std::map<std::string, std::string>
-      types_;  // property -> "int", "double", "bool", "string", "text"
+  // property -> "int", "double", "bool", "string", "text"
+  std::map<std::string, std::string, std::less<>> types_;
   std::vector<std::string> text_properties_;  // those searched as words
 };
 

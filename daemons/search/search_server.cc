@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "orvex/foundation/json.h"
+#include "search/json_text.h"
 #include "search/search_error.h"
 
 namespace orvex {
@@ -191,7 +192,7 @@ void SearchServer::OnFrame(Connection& c) {
   } else {
     answer = engine_.Handle(request, c.caller);
   }
-  Answer(c, toString(answer), /*close_after=*/false);
+  Answer(c, JsonText(answer), /*close_after=*/false);
 }
 
 void SearchServer::OnReadable(Connection& c) {

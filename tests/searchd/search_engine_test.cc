@@ -11,6 +11,7 @@
 
 #include "search/case_fold.h"
 #include "search/search_error.h"
+#include "search/sqlite_db.h"
 #include "searchd/searchd_fixture.h"
 
 namespace orvex {
@@ -28,7 +29,89 @@ class SearchEngineTest : public SearchdLoopTest {
   Json::Value GetByPrefix(const std::string& prefix) {
     return Ok(PrefixQuery("document_get_by_query", kId, prefix));
   }
+
+  // FTS5's own check that both full-text indexes hold exactly their
+  // content tables' committed rows; throws (kStorage) when they do not.
+  void CheckFullTextIndexes() {
+    search::SqliteDb db(DbPath(), /*create=*/false);
+    EXPECT_NO_THROW(db.Exec("INSERT INTO name_grams(name_grams) VALUES ('integrity-check')"));
+    EXPECT_NO_THROW(db.Exec("INSERT INTO words(words) VALUES ('integrity-check')"));
+  }
 };
+
+// Names and words enter the full-text indexes at commit; whatever happens to
+// a document before, after or between commits, searches see its last state.
+TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
+  auto text_search = [&](const std::string& words) {
+    Json::Value data;
+    data["text"] = words;
+    return HitPaths(SearchFor(data));
+  };
+  using Paths = std::vector<std::string>;
+  Json::Value a = FileDoc("/v/s/alpha_report.txt");
+  a["KALOMDTextContent"] = "quarterly figures";
+  Ok(Upsert(kId, a));
+  Json::Value gone = FileDoc("/v/s/ephemeral.txt");
+  gone["KALOMDTextContent"] = "vanishing words";
+  Ok(Upsert(kId, gone));
+  Json::Value del = Command("document_del_by_id", kId);
+  del["data"]["doc_id"] = "/v/s/ephemeral.txt";
+  EXPECT_EQ(1, Ok(del)["data"]["deleted"].asInt());
+  // Not committed: not searchable yet.
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("alpha")));
+  Commit();
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, HitPaths(SearchName("ALPHA")));
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("quarterly"));
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("ephemeral")));
+  EXPECT_EQ(Paths{}, text_search("vanishing"));
+
+  // The same document sent again, unchanged and then with new words.
+  Ok(Upsert(kId, a));
+  Commit();
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, HitPaths(SearchName("alpha_rep")));
+  a["KALOMDTextContent"] = "annual summary";
+  Ok(Upsert(kId, a));
+  Commit();
+  EXPECT_EQ(Paths{}, text_search("quarterly"));
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("annual"));
+
+  // Renamed (a new search name), then renamed again before the commit.
+  Json::Value renamed;
+  renamed["KALOMDSearchFileName"] = "beta_report.txt";
+  Ok(SetById(kId, "/v/s/alpha_report.txt", renamed));
+  renamed["KALOMDSearchFileName"] = "gamma_report.txt";
+  Ok(SetById(kId, "/v/s/alpha_report.txt", renamed));
+  Commit();
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("alpha")));
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("beta")));
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, HitPaths(SearchName("gamma")));
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("summary"));
+
+  // Moved onto another document's path: one document remains there.
+  Json::Value b = FileDoc("/v/s/beta.txt");
+  b["KALOMDTextContent"] = "beta words";
+  Ok(Upsert(kId, b));
+  Commit();
+  Json::Value moved = FileDoc("/v/s/beta.txt");
+  moved["KALOMDSearchFileName"] = "delta.txt";
+  moved["KALOMDTextContent"] = "delta words";
+  Json::Value req = Upsert(kId, moved);
+  req["data"]["doc_id"] = "/v/s/alpha_report.txt";
+  Ok(req);
+  Commit();
+  EXPECT_EQ(Paths{"/v/s/beta.txt"}, DocPaths(GetByPrefix("/v/s/")));
+  EXPECT_EQ(Paths{"/v/s/beta.txt"}, text_search("words"));
+  EXPECT_EQ(Paths{"/v/s/beta.txt"}, HitPaths(SearchName("delta")));
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("gamma")));
+  CheckFullTextIndexes();
+
+  // Deleted by prefix, committed, and the index is empty of it.
+  Ok(PrefixQuery("document_del_by_query", kId, "/v/s/"));
+  Commit();
+  EXPECT_EQ(Paths{}, HitPaths(SearchName("delta")));
+  EXPECT_EQ(Paths{}, text_search("words"));
+  CheckFullTextIndexes();
+}
 
 TEST_F(SearchEngineTest, UpsertThenSetKeepsThePropertiesNotSet) {
   Json::Value doc = FileDoc("/v/s/song.mp3", 4000);
