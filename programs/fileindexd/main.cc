@@ -25,7 +25,6 @@ namespace {
 
 constexpr char kIdent[] = "fileindexd";
 constexpr int kExitFailure = 1;
-constexpr int kExitUsage = 2;
 constexpr int kStepMs = 1000;
 constexpr char kPidPath[] = "/var/run/fileindexd.pid";
 
@@ -44,10 +43,7 @@ constexpr char kUsage[] =
     "fileindexd already answers on the socket, or the socket cannot be made),\n"
     "2 on bad usage.\n";
 
-class UsageError : public std::runtime_error {
- public:
-  using std::runtime_error::runtime_error;
-};
+using UsageError = orvex::portable::DaemonUsageError;
 
 struct Options {
   bool help = false;
@@ -104,20 +100,5 @@ int Serve(const Options& opt) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  Options opt;
-  try {
-    opt = ParseArgs(argc, argv);
-  } catch (const UsageError& e) {
-    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
-    return kExitUsage;
-  }
-  if (opt.help) {
-    std::cout << kUsage;
-    return 0;
-  }
-  if (opt.version) {
-    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
-    return 0;
-  }
-  return Serve(opt);
+  return orvex::portable::DaemonMain(argc, argv, kIdent, kUsage, ParseArgs, Serve);
 }

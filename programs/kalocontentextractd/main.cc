@@ -34,7 +34,6 @@ using orvex::portable::RootPath;
 
 constexpr char kIdent[] = "kalocontentextractd";
 constexpr int kExitFailure = 1;
-constexpr int kExitUsage = orvex::portable::kExtractExitUsage;
 constexpr int kRoundMs = 60000;  // any wait ends sooner at a deadline or a signal
 
 constexpr char kUsage[] =
@@ -59,10 +58,7 @@ constexpr char kUsage[] =
     "cannot start. Test facility: ORVEX_EXTRACT_FAULTS=1 makes files named *.crash,\n"
     "*.hang and *.hog crash, hang and exhaust memory in the worker.\n";
 
-class UsageError : public std::runtime_error {
- public:
-  using std::runtime_error::runtime_error;
-};
+using UsageError = orvex::portable::DaemonUsageError;
 
 struct Options {
   bool help = false;
@@ -169,21 +165,7 @@ int Serve(const Options& opt) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  Options opt;
-  try {
-    opt = ParseArgs(argc, argv);
-  } catch (const UsageError& e) {
-    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
-    return kExitUsage;
-  }
-  if (opt.help) {
-    std::cout << kUsage;
-    return 0;
-  }
-  if (opt.version) {
-    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
-    return 0;
-  }
-  if (!opt.extract.empty()) return ExtractOne(opt);
-  return Serve(opt);
+  return orvex::portable::DaemonMain(argc, argv, kIdent, kUsage, ParseArgs, [](const Options& opt) {
+    return opt.extract.empty() ? Serve(opt) : ExtractOne(opt);
+  });
 }

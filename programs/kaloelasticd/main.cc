@@ -33,7 +33,6 @@ using orvex::portable::RootPath;
 constexpr char kIdent[] = "kaloelasticd";
 constexpr char kPidPath[] = "/var/run/kaloelasticd.pid";
 constexpr int kExitFailure = 1;
-constexpr int kExitUsage = 2;
 constexpr int kRoundMs = 60000;  // any wait ends sooner on a request or a signal
 
 constexpr char kUsage[] =
@@ -68,7 +67,7 @@ Options ParseArgs(int argc, char** argv) {
     } else if (arg == "--foreground") {
       opt.foreground = true;
     } else {
-      throw std::invalid_argument("unknown argument " + arg);
+      throw orvex::portable::DaemonUsageError("unknown argument " + arg);
     }
   }
   return opt;
@@ -116,20 +115,5 @@ int Serve(const Options& opt) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  Options opt;
-  try {
-    opt = ParseArgs(argc, argv);
-  } catch (const std::invalid_argument& e) {
-    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
-    return kExitUsage;
-  }
-  if (opt.help) {
-    std::cout << kUsage;
-    return 0;
-  }
-  if (opt.version) {
-    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
-    return 0;
-  }
-  return Serve(opt);
+  return orvex::portable::DaemonMain(argc, argv, kIdent, kUsage, ParseArgs, Serve);
 }

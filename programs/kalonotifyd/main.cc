@@ -34,7 +34,6 @@ using orvex::portable::RootPath;
 
 constexpr char kIdent[] = "kalonotifyd";
 constexpr int kExitFailure = 1;
-constexpr int kExitUsage = 2;
 constexpr int kStepMs = 1000;
 constexpr int kFinalRounds = 64;
 
@@ -55,10 +54,7 @@ constexpr char kUsage[] =
     "event queue was exceeded, raise fs.inotify.max_user_watches or\n"
     "fs.inotify.max_queued_events with sysctl.\n";
 
-class UsageError : public std::runtime_error {
- public:
-  using std::runtime_error::runtime_error;
-};
+using UsageError = orvex::portable::DaemonUsageError;
 
 struct Options {
   bool help = false;
@@ -152,20 +148,5 @@ int Serve(const Options& opt) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  Options opt;
-  try {
-    opt = ParseArgs(argc, argv);
-  } catch (const UsageError& e) {
-    std::cerr << kIdent << ": " << e.what() << "\n" << kUsage;
-    return kExitUsage;
-  }
-  if (opt.help) {
-    std::cout << kUsage;
-    return 0;
-  }
-  if (opt.version) {
-    std::cout << kIdent << " " << ORVEX_VERSION << "\n";
-    return 0;
-  }
-  return Serve(opt);
+  return orvex::portable::DaemonMain(argc, argv, kIdent, kUsage, ParseArgs, Serve);
 }

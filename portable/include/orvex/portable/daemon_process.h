@@ -5,9 +5,12 @@
 #ifndef ORVEX_PORTABLE_DAEMON_PROCESS_H_
 #define ORVEX_PORTABLE_DAEMON_PROCESS_H_
 
+#include <iostream>
+#include <stdexcept>
 #include <string>
 
 #include "orvex/portable/file_descriptor.h"
+#include "orvex/version.h"
 
 namespace orvex {
 namespace portable {
@@ -32,6 +35,37 @@ int DetachUnlessForeground(bool foreground, FileDescriptor& ready);
 // that the daemon serves. Nothing to do for a foreground run (ready is
 // invalid). False with errno set when the starter could not be told.
 bool AnnounceReady(FileDescriptor& ready, const std::string& pid_path);
+
+// Bad usage of a daemon's command line: DaemonMain prints it with the usage.
+class DaemonUsageError : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+// The main of every daemon program. parse(argc, argv) gives the options,
+// which have `help` and `version` members, or throws DaemonUsageError (then
+// "IDENT: reason" and the usage go to standard error, exit status 2).
+// --help prints the usage and --version "IDENT VERSION" (status 0);
+// otherwise run(options) runs the daemon and gives the exit status.
+template <typename Parse, typename Run>
+int DaemonMain(int argc, char** argv, const char* ident, const char* usage, Parse parse, Run run) {
+  decltype(parse(argc, argv)) options;
+  try {
+    options = parse(argc, argv);
+  } catch (const DaemonUsageError& e) {
+    std::cerr << ident << ": " << e.what() << "\n" << usage;
+    return 2;
+  }
+  if (options.help) {
+    std::cout << usage;
+    return 0;
+  }
+  if (options.version) {
+    std::cout << ident << " " << ORVEX_VERSION << "\n";
+    return 0;
+  }
+  return run(options);
+}
 
 }  // namespace portable
 }  // namespace orvex
