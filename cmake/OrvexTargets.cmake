@@ -206,6 +206,18 @@ function(orvex_install)
   install(FILES ${PROJECT_BINARY_DIR}/include/orvex/version.h
           DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/orvex)
 
+  # systemd units of the four daemons, for a real machine; their names are the
+  # services the management operations start and stop. The format pages they
+  # point to are installed beside them.
+  set(ORVEX_DOC_DIR ${CMAKE_INSTALL_FULL_DOCDIR})
+  file(GLOB units ${PROJECT_SOURCE_DIR}/packaging/systemd/*.service.in)
+  foreach(unit ${units})
+    get_filename_component(name ${unit} NAME_WLE)
+    configure_file(${unit} ${PROJECT_BINARY_DIR}/systemd/${name} @ONLY)
+    install(FILES ${PROJECT_BINARY_DIR}/systemd/${name} DESTINATION lib/systemd/system)
+  endforeach()
+  install(DIRECTORY ${PROJECT_SOURCE_DIR}/doc/ DESTINATION ${CMAKE_INSTALL_DOCDIR})
+
   install(EXPORT OrvexFileindexTargets NAMESPACE Orvex::
           FILE OrvexFileindexTargets.cmake DESTINATION ${cmake_dir})
   configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/OrvexConfig.cmake.in

@@ -68,6 +68,8 @@ int RunStatsCommand(const Args& args);    // search_commands.cc
 int RunUpCommand(const Args& args);       // system_commands.cc
 int RunDownCommand(const Args& args);     // system_commands.cc
 int RunIndexCommand(const Args& args);    // system_commands.cc
+// Each daemon, running or not, and each share's indexing progress.
+void PrintDaemonStatus();  // system_commands.cc
 
 // The management commands (manage_commands.cc): two groups of their own and
 // the changing subcommands of the folder and share groups.

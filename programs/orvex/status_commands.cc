@@ -261,6 +261,7 @@ int RunStatusCommand(const Args& args) {
     PrintStatusJson(resume_time, shares);
   } else {
     PrintStatusText(resume_time, shares);
+    PrintDaemonStatus();
   }
   return kExitOk;
 }

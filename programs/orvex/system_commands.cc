@@ -347,7 +347,52 @@ int Index(const Args& args) {
   return kExitOk;
 }
 
+std::string ShareProgress(const Json::Value& share) {
+  std::string text = share["state"].asString() + ", " +
+                     std::to_string(share["total_done"].asInt64()) + " documents indexed";
+  const long long todo = share["todo"].asInt64();
+  const double rate = share["rate"].asDouble();
+  if (todo > 0) text += ", " + std::to_string(todo) + " to do";
+  if (todo > 0 && rate > 0) {
+    text += " at " + std::to_string(static_cast<long long>(rate)) + "/s, about " +
+            std::to_string(static_cast<long long>(todo / rate) + 1) + " s left";
+  }
+  const std::string error = share["last_error"].asString();
+  if (!error.empty()) text += "; last error: " + error;
+  return text;
+}
+
 }  // namespace
+
+void PrintDaemonStatus() {
+  bool any = false;
+  for (const Daemon& daemon : kDaemons) any = any || RunningPid(daemon) != 0;
+  if (!any) {
+    std::cout << "daemons: none running (start them: orvex up)\n";
+    return;
+  }
+  for (const Daemon& daemon : kDaemons) {
+    const pid_t pid = RunningPid(daemon);
+    std::cout << daemon.name << ": "
+              << (pid != 0 ? "running (pid " + std::to_string(pid) + ")"
+                           : std::string("not running"))
+              << "\n";
+  }
+  Json::Value request(Json::objectValue);
+  request["type"] = "status";
+  request["data"] = Json::Value();
+  Json::Value status;
+  try {
+    status = AskDaemon(kIndexSocketPath, kIndexDaemon, request);
+  } catch (const orvex::Error& e) {
+    std::cout << "progress: unknown (" << e.reason() << ")\n";
+    return;
+  }
+  const Json::Value& shares = status["shares"];
+  for (const std::string& name : shares.getMemberNames()) {
+    std::cout << "share " << name << ": " << ShareProgress(shares[name]) << "\n";
+  }
+}
 
 int RunUpCommand(const Args& args) {
   if (WantsHelp(args)) {

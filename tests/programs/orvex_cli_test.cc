@@ -262,7 +262,8 @@ TEST_F(OrvexCliTest, ShareCommandsManageTheRegistryAlignedByDisplayWidth) {
 }
 
 TEST_F(OrvexCliTest, StatusShowsThePauseAndEachSharesFlags) {
-  EXPECT_EQ("indexing: running\n", Run({"status"}).out);
+  EXPECT_EQ("indexing: running\ndaemons: none running (start them: orvex up)\n",
+            Run({"status"}).out);
   EXPECT_EQ(Parse(R"({"state": "running", "resume_time": -1, "shares": {}})"),
             RunJson({"status", "--json"}));
   EXPECT_FALSE(fs::exists(StatusPath())) << "status must not create the file";
@@ -270,11 +271,16 @@ TEST_F(OrvexCliTest, StatusShowsThePauseAndEachSharesFlags) {
   WriteStatus(R"({"resume_time": 0, "share": {"photo": 1, "写真": 0}})");
   const ProgramOutcome status = Run({"status"});
   EXPECT_EQ(0, status.status) << status.err;
-  EXPECT_EQ("indexing: paused with no end\nphoto:    needs re-index\n写真:     ok\n", status.out);
+  EXPECT_EQ(
+      "indexing: paused with no end\nphoto:    needs re-index\n写真:     ok\ndaemons: none running "
+      "(start them: orvex up)\n",
+      status.out);
   EXPECT_TRUE(RunJson({"status", "--json"})["shares"]["photo"]["need_reindex"].asBool());
   WriteStatus(R"({"resume_time": 946728000})");
-  EXPECT_EQ("indexing: paused until 2000-01-01 12:00:00 UTC (that time has passed)\n",
-            Run({"status"}).out);
+  EXPECT_EQ(
+      "indexing: paused until 2000-01-01 12:00:00 UTC (that time has passed)\ndaemons: none "
+      "running (start them: orvex up)\n",
+      Run({"status"}).out);
 }
 
 TEST_F(OrvexCliTest, BrokenStateFilesAreNamedWithTheCauseAndTheNextStep) {

@@ -68,6 +68,11 @@ TEST_F(WholeSystemTest, IndexedDirectoryIsSearchableByNameAndTextAndFollowsChang
   EXPECT_NE(std::string::npos, index.out.find("registered share library at " + dir)) << index.out;
   EXPECT_NE(std::string::npos, index.out.find("is searchable")) << index.out;
 
+  // The folder, notes/, Straße.txt and readme.md: nothing under @eaDir.
+  const std::string status = Run({"status"}).out;
+  EXPECT_NE(std::string::npos, status.find("fileindexd: running (pid ")) << status;
+  EXPECT_NE(std::string::npos, status.find("share library: idle, 4 documents indexed")) << status;
+
   // Full case folding: "STRASSE" finds "Straße".
   const std::string by_name = Run({"search", "STRASSE"}).out;
   EXPECT_NE(std::string::npos, by_name.find(dir + "/notes/Straße.txt")) << by_name;
