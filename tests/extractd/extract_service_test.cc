@@ -311,7 +311,14 @@ TEST_F(ExtractServiceTest, ClientThatLeavesBeforeItsAnswerCostsNothing) {
     SendRaw(gone, Framed("{\"path\": \"" + File("slow.hang") + "\"}"));
     for (int round = 0; round < 3; ++round) service_->RunOnce(0);  // accept, read, dispatch
   }
-  EXPECT_TRUE(Ask(File("next.txt"))["ok"].asBool());
+  // Whether the abandoned file reached the only worker depends on how fast
+  // that worker started. If it did, the next file may wait in the queue past
+  // its own deadline and be answered busy, but never more than once: the
+  // hung worker is stopped at its deadline and replaced.
+  Json::Value next = Ask(File("next.txt"));
+  if (next["busy"].asBool()) next = Ask(File("next.txt"));
+  EXPECT_TRUE(next["ok"].asBool()) << next;
+  EXPECT_EQ("next.txt", next["data"]["KALOMDTitle"].asString());
 }
 
 TEST_F(ExtractServiceTest, SecondDaemonOnTheSameSocketIsRefused) {
