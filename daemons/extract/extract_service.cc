@@ -24,12 +24,16 @@
 #include <string>
 #include <utility>
 
+#include "compact_json.h"
 #include "extract_worker.h"
 #include "kalo_log.h"
 
 namespace orvex {
 namespace portable {
 namespace {
+
+using orvex::portable::CompactJsonText;
+using orvex::portable::ParseCompactJson;
 
 constexpr size_t kReadChunk = 64 * 1024;
 constexpr int kAcceptsPerRound = 16;
@@ -43,32 +47,6 @@ constexpr size_t kRecycledBufferBytes = 4u << 20;
 // A worker's answer carries at most the parsers' text limit and the
 // properties: far below this. More means the worker is not ours any more.
 constexpr uint32_t kMaxAnswerBytes = 64u << 20;
-
-std::string JsonText(const Json::Value& value) {
-  // Made once per thread, as the reader.
-  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    builder["emitUTF8"] = true;
-    return builder.newStreamWriter();
-  }());
-  std::ostringstream out;
-  writer->write(value, &out);
-  return out.str();
-}
-
-bool ParseJson(const char* begin, const char* end, Json::Value& value) {
-  // Made once per thread: a reader's settings cost more to build than a
-  // small message costs to parse.
-  thread_local const std::unique_ptr<Json::CharReader> reader(
-      Json::CharReaderBuilder().newCharReader());
-  std::string errors;
-  return reader->parse(begin, end, &value, &errors);
-}
-
-bool ParseJson(const std::string& text, Json::Value& value) {
-  return ParseJson(text.data(), text.data() + text.size(), value);
-}
 
 // True when what follows a worker's JSON header (from header_end to end) is
 // what the header announces: the NUL and "text_bytes" bytes of text, or
@@ -405,7 +383,7 @@ void ExtractService::TakeRequests(uint64_t id) {
 
 void ExtractService::HandleRequest(uint64_t id, const std::string& body) {
   Json::Value request;
-  if (!ParseJson(body, request) || !request.isObject() || !request["path"].isString() ||
+  if (!ParseCompactJson(body, request) || !request.isObject() || !request["path"].isString() ||
       request["path"].asString().empty()) {
     Answer(id, Failure("bad request: expected {\"path\": FULL_PATH}"), /*close_after=*/false);
     return;
@@ -431,7 +409,7 @@ void ExtractService::HandleRequest(uint64_t id, const std::string& body) {
 }
 
 void ExtractService::Answer(uint64_t id, const Json::Value& answer, bool close_after) {
-  AnswerFrame(id, Frame(JsonText(answer)), close_after);
+  AnswerFrame(id, Frame(CompactJsonText(answer)), close_after);
 }
 
 void ExtractService::AnswerFrame(uint64_t id, std::string frame, bool close_after) {
@@ -512,7 +490,7 @@ void ExtractService::ReadWorker(size_t index) {
   const char* header_end = static_cast<const char*>(std::memchr(body, '\0', end - body));
   if (header_end == nullptr) header_end = end;
   Json::Value header;
-  const bool parsed = ParseJson(body, header_end, header) && header.isObject();
+  const bool parsed = ParseCompactJson(body, header_end, header) && header.isObject();
   if (!worker.ready && !worker.busy && parsed && header["ready"].asBool()) {
     worker.ready = true;
     return;
@@ -596,7 +574,7 @@ void ExtractService::Dispatch() {
     queue_.pop_front();
     Json::Value request(Json::objectValue);
     request["path"] = pending.path;
-    const std::string frame = Frame(JsonText(request));
+    const std::string frame = Frame(CompactJsonText(request));
     // A request is far smaller than an empty socket buffer: it goes whole.
     const ssize_t n = ::send(worker.channel.get(), frame.data(), frame.size(), MSG_NOSIGNAL);
     worker.busy = true;

@@ -21,11 +21,15 @@
 #include <string>
 #include <utility>
 
+#include "compact_json.h"
 #include "extract_service.h"
 
 namespace orvex {
 namespace portable {
 namespace {
+
+using orvex::portable::CompactJsonText;
+using orvex::portable::ParseCompactJson;
 
 // "VmData:" of /proc/self/status, in bytes: what RLIMIT_DATA counts. Under
 // the address sanitizer this already includes its shadow memory, so the cap
@@ -48,29 +52,6 @@ bool CurrentDataBytes(rlim_t& bytes) {
 // its parent recognises. Nothing is freed or logged: there is no memory.
 void OnOutOfMemory() { ::_exit(kExtractExitMemoryCap); }
 
-// Compact, and UTF-8 written as itself: escaping every non-ASCII character
-// as \uXXXX would make the reader's work grow sixfold. The writer and the
-// reader are made once: their settings cost more to build than a small
-// message costs to write or parse (one of each per thread).
-std::string JsonText(const Json::Value& value) {
-  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    builder["emitUTF8"] = true;
-    return builder.newStreamWriter();
-  }());
-  std::ostringstream out;
-  writer->write(value, &out);
-  return out.str();
-}
-
-bool ParseJson(const std::string& text, Json::Value& value) {
-  thread_local const std::unique_ptr<Json::CharReader> reader(
-      Json::CharReaderBuilder().newCharReader());
-  std::string errors;
-  return reader->parse(text.data(), text.data() + text.size(), &value, &errors);
-}
-
 }  // namespace
 
 AnswerParts SplitAnswer(Json::Value answer) {
@@ -84,7 +65,7 @@ AnswerParts SplitAnswer(Json::Value answer) {
     parts.text.getString(&begin, &end);
     answer["text_bytes"] = static_cast<Json::UInt64>(end - begin);
   }
-  parts.json = JsonText(answer);
+  parts.json = CompactJsonText(answer);
   return parts;
 }
 
@@ -201,7 +182,7 @@ int RunOneShot(const std::string& path, int deadline_ms, int memory_mb, const Ex
     err = answer["reason"].asString();
     return kExtractExitNotRegular;
   }
-  out = JsonText(answer["data"]) + "\n";
+  out = CompactJsonText(answer["data"]) + "\n";
   if (!answer["ok"].asBool()) {
     err = answer["reason"].asString();
     return kExtractExitProblem;
@@ -219,7 +200,7 @@ void ServeWorker(FileDescriptor channel, int memory_mb, const Extractor& extract
   while (link.Recv(request)) {
     Json::Value parsed;
     Json::Value answer;
-    if (!ParseJson(request, parsed) || !parsed["path"].isString()) {
+    if (!ParseCompactJson(request, parsed) || !parsed["path"].isString()) {
       answer["ok"] = false;
       answer["reason"] = "bad request to worker";
     } else {

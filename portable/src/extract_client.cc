@@ -22,6 +22,7 @@
 #include <utility>
 #include <vector>
 
+#include "compact_json.h"
 #include "kalo/kalo_sock.h"
 #include "orvex/portable/atomic_file.h"
 #include "orvex/portable/extract_protocol.h"
@@ -33,6 +34,9 @@ namespace orvex {
 namespace portable {
 namespace {
 
+using orvex::portable::CompactJsonText;
+using orvex::portable::ParseCompactJson;
+
 using Clock = std::chrono::steady_clock;
 
 // The one-shot program prints one JSON object; anything much bigger than the
@@ -42,32 +46,6 @@ constexpr size_t kMaxProgramErrors = 4096;
 // Beyond the deadline, what the daemon may spend queueing one request (as
 // long again) and what the round trip costs.
 constexpr int kDaemonSlackMs = 1000;
-
-bool ParseJson(const char* begin, const char* end, Json::Value& value) {
-  // Made once per thread: a reader's settings cost more to build than a
-  // small message costs to parse.
-  thread_local const std::unique_ptr<Json::CharReader> reader(
-      Json::CharReaderBuilder().newCharReader());
-  std::string errors;
-  return reader->parse(begin, end, &value, &errors);
-}
-
-bool ParseJson(const std::string& text, Json::Value& value) {
-  return ParseJson(text.data(), text.data() + text.size(), value);
-}
-
-std::string JsonText(const Json::Value& value) {
-  // Made once per thread, as the reader.
-  thread_local const std::unique_ptr<Json::StreamWriter> writer([] {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    builder["emitUTF8"] = true;
-    return builder.newStreamWriter();
-  }());
-  std::ostringstream out;
-  writer->write(value, &out);
-  return out.str();
-}
 
 // For the failure record, which people read.
 std::string IndentedJsonText(const Json::Value& value) {
@@ -85,7 +63,7 @@ bool DecodeAnswer(const std::string& message, Json::Value& answer) {
   const char* end = begin + message.size();
   const char* header_end = static_cast<const char*>(std::memchr(begin, '\0', message.size()));
   if (header_end == nullptr) header_end = end;
-  if (!ParseJson(begin, header_end, answer) || !answer.isObject()) return false;
+  if (!ParseCompactJson(begin, header_end, answer) || !answer.isObject()) return false;
   if (!answer.isMember("text_bytes")) return header_end == end;
   const Json::Value& bytes = answer["text_bytes"];
   if (!bytes.isUInt64() || header_end == end ||
@@ -245,7 +223,7 @@ ExtractOutcome OutcomeOfExit(int status, const ChildOutput& output, int memory_m
   }
   ExtractOutcome outcome;
   if (code == kExtractExitOk || code == kExtractExitProblem) {
-    if (!ParseJson(output.out, outcome.data) || !outcome.data.isObject()) {
+    if (!ParseCompactJson(output.out, outcome.data) || !outcome.data.isObject()) {
       return Fault("the extraction program printed no JSON object");
     }
     outcome.kind = code == kExtractExitOk ? ExtractOutcome::kOk : ExtractOutcome::kProblem;
@@ -297,7 +275,7 @@ bool AskExtractDaemon(const std::string& socket_path, const std::string& path, i
   Json::Value request(Json::objectValue);
   request["path"] = path;
   request["deadline_ms"] = deadline_ms;
-  const std::string message = JsonText(request);
+  const std::string message = CompactJsonText(request);
   // A kept connection may have been closed by the daemon since (it drops
   // idle ones, or it restarted): that one is given up and the request sent
   // once more on a new connection.
@@ -400,7 +378,7 @@ Json::Value ExtractFailureRecord::Load() const {
   Json::Value record;
   // A missing or damaged record forgets old failures: those files are
   // simply tried once more.
-  if (!ReadWholeFile(path_, text) || !ParseJson(text, record) || !record.isObject() ||
+  if (!ReadWholeFile(path_, text) || !ParseCompactJson(text, record) || !record.isObject() ||
       !record["files"].isObject()) {
     return Json::Value(Json::objectValue);
   }
