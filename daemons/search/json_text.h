@@ -1,26 +1,16 @@
-// Compact JSON text of a Json::Value, written straight into a string: the
-// daemon writes one for every document it stores and every answer it gives,
-// and jsoncpp's stream writer costs a stream and a virtual call per value.
-// The text parses back to an equal value (strings as UTF-8, as received).
-// Safe for concurrent use.
+// The daemon's JSON text: the platform's compact writer (see
+// orvex/portable/json_text.h), strings written as received. It writes one
+// for every document it stores and every answer it gives.
 #ifndef ORVEX_SEARCH_JSON_TEXT_H_
 #define ORVEX_SEARCH_JSON_TEXT_H_
 
-#include <json/json.h>
-
-#include <string>
+#include "orvex/portable/json_text.h"
 
 namespace orvex {
 namespace search {
 
-// Appends the text of value to out.
-void AppendJsonText(const Json::Value& value, std::string& out);
-
-inline std::string JsonText(const Json::Value& value) {
-  std::string out;
-  AppendJsonText(value, out);
-  return out;
-}
+using portable::AppendJsonText;
+using portable::JsonText;
 
 }  // namespace search
 }  // namespace orvex

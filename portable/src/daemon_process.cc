@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdlib>
 
 #include "orvex/portable/atomic_file.h"
 
@@ -65,6 +66,55 @@ bool AnnounceReady(FileDescriptor& ready, const std::string& pid_path) {
   const bool told = ::write(ready.get(), &byte, 1) == 1;
   ready.reset();
   return told;
+}
+
+DaemonFlagParser& DaemonFlagParser::Number(const std::string& name, int low, int high, int& value) {
+  valued_.push_back(
+      {name, [name, low, high, &value](const std::string& text) {
+         char* end = nullptr;
+         errno = 0;
+         const long number = std::strtol(text.c_str(), &end, 10);
+         if (text.empty() || *end != '\0' || errno != 0 || number < low || number > high) {
+           throw DaemonUsageError(name + " takes a number from " + std::to_string(low) + " to " +
+                                  std::to_string(high) + ", not \"" + text + "\"");
+         }
+         value = static_cast<int>(number);
+       }});
+  return *this;
+}
+
+DaemonFlagParser& DaemonFlagParser::Text(const std::string& name, std::string& value,
+                                         const char* if_empty) {
+  valued_.push_back({name, [&value, if_empty](const std::string& text) {
+                       if (text.empty() && if_empty != nullptr) throw DaemonUsageError(if_empty);
+                       value = text;
+                     }});
+  return *this;
+}
+
+void DaemonFlagParser::Parse(int argc, char** argv) const {
+  for (int i = 1; i < argc; ++i) {
+    const std::string arg = argv[i];
+    if (arg == "--help") {
+      options_.help = true;
+      continue;
+    }
+    if (arg == "--version") {
+      options_.version = true;
+      continue;
+    }
+    if (arg == "--foreground") {
+      options_.foreground = true;
+      continue;
+    }
+    const Valued* option = nullptr;
+    for (const Valued& valued : valued_) {
+      if (valued.name == arg) option = &valued;
+    }
+    if (option == nullptr) throw DaemonUsageError("unknown argument " + arg);
+    if (i + 1 >= argc) throw DaemonUsageError(arg + " needs a value");
+    option->take(argv[++i]);
+  }
 }
 
 }  // namespace portable

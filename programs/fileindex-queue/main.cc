@@ -17,10 +17,10 @@
 #include <stdexcept>
 #include <string>
 
-#include "json_text.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/log.h"
 #include "orvex/portable/file_descriptor.h"
+#include "orvex/portable/json_text.h"
 #include "orvex/queue/op_tree.h"
 #include "orvex/version.h"
 
@@ -212,10 +212,10 @@ void PrintJson(OPTree& tree, Output& out) {
   doc["lines_skipped"] = static_cast<Json::UInt64>(s.lines_skipped);
   doc["pending"] = static_cast<Json::UInt64>(s.pending);
   doc["crashed"] = s.crashed;
-  // jsoncpp's writer passes bytes that are not UTF-8 through as they are,
-  // which no JSON reader need accept.
+  // Paths are bytes: jsoncpp's writer would pass those that are not UTF-8
+  // through as they are, which no JSON reader need accept.
   std::string text;
-  fileindex_queue::AppendJsonText(doc, text);
+  orvex::portable::AppendJsonText(doc, text, orvex::portable::NonUtf8Bytes::kSurrogateEscape);
   text += '\n';
   out.Write(text);
 }

@@ -12,10 +12,8 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 #include <iostream>
-#include <stdexcept>
 #include <string>
 
 #include "extract_service.h"
@@ -58,57 +56,21 @@ constexpr char kUsage[] =
     "cannot start. Test facility: ORVEX_EXTRACT_FAULTS=1 makes files named *.crash,\n"
     "*.hang and *.hog crash, hang and exhaust memory in the worker.\n";
 
-using UsageError = orvex::portable::DaemonUsageError;
-
-struct Options {
-  bool help = false;
-  bool version = false;
-  bool foreground = false;
+struct Options : orvex::portable::DaemonOptions {
   std::string extract;  // one-shot mode when not empty
   int workers = 2;
   int deadline_ms = orvex::portable::kDefaultExtractDeadlineMs;
   int memory_mb = orvex::portable::kDefaultExtractMemoryMb;
 };
 
-int Number(const std::string& option, const std::string& text, int low, int high) {
-  char* end = nullptr;
-  errno = 0;
-  const long value = std::strtol(text.c_str(), &end, 10);
-  if (text.empty() || *end != '\0' || errno != 0 || value < low || value > high) {
-    throw UsageError(option + " takes a number from " + std::to_string(low) + " to " +
-                     std::to_string(high) + ", not \"" + text + "\"");
-  }
-  return static_cast<int>(value);
-}
-
 Options ParseArgs(int argc, char** argv) {
   Options opt;
-  for (int i = 1; i < argc; ++i) {
-    const std::string arg = argv[i];
-    const bool has_value = i + 1 < argc;
-    auto value = [&]() -> std::string {
-      if (!has_value) throw UsageError(arg + " needs a value");
-      return argv[++i];
-    };
-    if (arg == "--help") {
-      opt.help = true;
-    } else if (arg == "--version") {
-      opt.version = true;
-    } else if (arg == "--foreground") {
-      opt.foreground = true;
-    } else if (arg == "--extract") {
-      opt.extract = value();
-      if (opt.extract.empty()) throw UsageError("--extract needs a path");
-    } else if (arg == "--workers") {
-      opt.workers = Number(arg, value(), 1, 16);
-    } else if (arg == "--deadline-ms") {
-      opt.deadline_ms = Number(arg, value(), 1, 24 * 3600 * 1000);
-    } else if (arg == "--memory-mb") {
-      opt.memory_mb = Number(arg, value(), 1, 1 << 20);
-    } else {
-      throw UsageError("unknown argument " + arg);
-    }
-  }
+  orvex::portable::DaemonFlagParser(opt)
+      .Text("--extract", opt.extract, "--extract needs a path")
+      .Number("--workers", 1, 16, opt.workers)
+      .Number("--deadline-ms", 1, 24 * 3600 * 1000, opt.deadline_ms)
+      .Number("--memory-mb", 1, 1 << 20, opt.memory_mb)
+      .Parse(argc, argv);
   return opt;
 }
 

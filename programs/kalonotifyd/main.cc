@@ -11,11 +11,9 @@
 
 #include <cerrno>
 #include <chrono>
-#include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <iostream>
-#include <stdexcept>
 #include <string>
 
 #include "kalo/kalo_notify.h"
@@ -54,38 +52,15 @@ constexpr char kUsage[] =
     "event queue was exceeded, raise fs.inotify.max_user_watches or\n"
     "fs.inotify.max_queued_events with sysctl.\n";
 
-using UsageError = orvex::portable::DaemonUsageError;
-
-struct Options {
-  bool help = false;
-  bool version = false;
-  bool foreground = false;
+struct Options : orvex::portable::DaemonOptions {
   int status_interval_s = 5;
 };
 
 Options ParseArgs(int argc, char** argv) {
   Options opt;
-  for (int i = 1; i < argc; ++i) {
-    const std::string arg = argv[i];
-    if (arg == "--help") {
-      opt.help = true;
-    } else if (arg == "--version") {
-      opt.version = true;
-    } else if (arg == "--foreground") {
-      opt.foreground = true;
-    } else if (arg == "--status-interval") {
-      if (i + 1 >= argc) throw UsageError(arg + " needs a value");
-      const std::string text = argv[++i];
-      char* end = nullptr;
-      const long value = std::strtol(text.c_str(), &end, 10);
-      if (text.empty() || *end != '\0' || value < 1 || value > 3600) {
-        throw UsageError(arg + " takes a number from 1 to 3600, not \"" + text + "\"");
-      }
-      opt.status_interval_s = static_cast<int>(value);
-    } else {
-      throw UsageError("unknown argument " + arg);
-    }
-  }
+  orvex::portable::DaemonFlagParser(opt)
+      .Number("--status-interval", 1, 3600, opt.status_interval_s)
+      .Parse(argc, argv);
   return opt;
 }
 

@@ -19,24 +19,12 @@
 #include "kalo/kalo_sock.h"
 #include "orvex/portable/extract_protocol.h"
 #include "orvex/portable/file_descriptor.h"
-#include "orvex/version.h"
 #include "programs/program_test.h"
+#include "support/sanitizer.h"
 
 namespace orvex {
 namespace testing {
 namespace {
-
-#if defined(__SANITIZE_ADDRESS__)
-constexpr bool kSanitized = true;  // its runtime turns crashes and failed allocations into exit 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer)
-constexpr bool kSanitized = true;
-#else
-constexpr bool kSanitized = false;
-#endif
-#else
-constexpr bool kSanitized = false;
-#endif
 
 class KalocontentextractdTest : public ProgramTest {
  protected:
@@ -102,22 +90,6 @@ class KalocontentextractdTest : public ProgramTest {
 
   pid_t daemon_pid_ = -1;
 };
-
-TEST_F(KalocontentextractdTest, HelpVersionAndBadUsage) {
-  ProgramOutcome run = Run({"--help"});
-  EXPECT_EQ(0, run.status);
-  EXPECT_NE(std::string::npos, run.out.find("--extract PATH"));
-  EXPECT_NE(std::string::npos, run.out.find("ORVEX_EXTRACT_FAULTS"));
-  run = Run({"--version"});
-  EXPECT_EQ(0, run.status);
-  EXPECT_EQ(std::string("kalocontentextractd ") + ORVEX_VERSION + "\n", run.out);
-  for (const std::vector<std::string>& args : std::vector<std::vector<std::string>>{
-           {"--bogus"}, {"--extract"}, {"--workers", "0"}, {"--deadline-ms", "soon"}}) {
-    run = Run(args);
-    EXPECT_EQ(orvex::portable::kExtractExitUsage, run.status) << args[0];
-    EXPECT_NE(std::string::npos, run.err.find("usage:")) << args[0];
-  }
-}
 
 TEST_F(KalocontentextractdTest, OneShotPrintsTheMetadataObject) {
   const std::string path = Write("files/notes.txt", "hello\n");

@@ -1,6 +1,7 @@
 // The real kalonotifyd in its own root: it picks up a registration made
 // after it started, and on SIGTERM writes every change the kernel reported
-// before it exits, then leaves its status file saying it stopped.
+// before it exits, then leaves its status file saying it stopped. Its command
+// line is tested with the other daemons' (programs/daemon_usage_test.cc).
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/wait.h>
@@ -102,20 +103,6 @@ TEST_F(KalonotifydTest, WritesEveryChangeBeforeItStops) {
   ASSERT_TRUE(fromFile(status, dir_.Join("var/run/kalonotifyd.status.json")));
   EXPECT_FALSE(status["running"].asBool());
   EXPECT_EQ(share_, status["folders"][0]["path"].asString());
-}
-
-TEST(KalonotifydProgramTest, HelpVersionAndBadUsage) {
-  testing::TempDir io;
-  const testing::ProgramOutcome help = testing::RunProgram(kProgram, {"--help"}, {}, io.path());
-  EXPECT_EQ(0, help.status);
-  EXPECT_NE(std::string::npos, help.out.find("fs.inotify.max_user_watches"));
-  const testing::ProgramOutcome version =
-      testing::RunProgram(kProgram, {"--version"}, {}, io.path());
-  EXPECT_EQ(0, version.status);
-  EXPECT_EQ(0u, version.out.rfind("kalonotifyd ", 0));
-  const testing::ProgramOutcome bad = testing::RunProgram(kProgram, {"--bogus"}, {}, io.path());
-  EXPECT_EQ(2, bad.status);
-  EXPECT_NE(std::string::npos, bad.err.find("unknown argument --bogus"));
 }
 
 }  // namespace

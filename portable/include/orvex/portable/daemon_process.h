@@ -5,9 +5,11 @@
 #ifndef ORVEX_PORTABLE_DAEMON_PROCESS_H_
 #define ORVEX_PORTABLE_DAEMON_PROCESS_H_
 
+#include <functional>
 #include <iostream>
 #include <stdexcept>
 #include <string>
+#include <vector>
 
 #include "orvex/portable/file_descriptor.h"
 #include "orvex/version.h"
@@ -40,6 +42,42 @@ bool AnnounceReady(FileDescriptor& ready, const std::string& pid_path);
 class DaemonUsageError : public std::runtime_error {
  public:
   using std::runtime_error::runtime_error;
+};
+
+// The options every daemon takes; a daemon's own options derive from it.
+struct DaemonOptions {
+  bool help = false;
+  bool version = false;
+  bool foreground = false;
+};
+
+// A daemon's command line: --help, --version and --foreground, and the
+// options with a value that the daemon declares, each given as "--name
+// VALUE". Parse throws DaemonUsageError for "unknown argument ARG", "ARG
+// needs a value" and a value the option refuses. The parser refers to the
+// options and values it fills: they must outlive it.
+class DaemonFlagParser {
+ public:
+  explicit DaemonFlagParser(DaemonOptions& options) : options_(options) {}
+
+  // name takes a whole number from low to high, stored in value; any other
+  // is refused as "NAME takes a number from LOW to HIGH, not "TEXT"".
+  DaemonFlagParser& Number(const std::string& name, int low, int high, int& value);
+  // name takes a text, stored in value; an empty text is refused with
+  // if_empty as the reason, unless that is null.
+  DaemonFlagParser& Text(const std::string& name, std::string& value, const char* if_empty);
+
+  // Reads argv[1] to argv[argc - 1] in order.
+  void Parse(int argc, char** argv) const;
+
+ private:
+  struct Valued {
+    std::string name;
+    std::function<void(const std::string& text)> take;  // throws DaemonUsageError
+  };
+
+  DaemonOptions& options_;
+  std::vector<Valued> valued_;
 };
 
 // The main of every daemon program. parse(argc, argv) gives the options,
