@@ -16,8 +16,9 @@
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"
 #include "orvex/portable/root.h"
-#include "status/fileindexd_peer.h"
+#include "support/framed_peer.h"
 #include "support/log_capture.h"
+#include "support/sanitizer.h"
 #include "support/temp_dir.h"
 
 namespace orvex {
@@ -48,7 +49,7 @@ TEST_F(SendCommandTest, FramesTypeAndDataAsNulTerminatedJson) {
   Json::Value data(Json::objectValue);
   data["share_name"] = std::string(5000, 's');  // several write chunks
   {
-    testing::FileindexdPeer daemon(socket_path_);
+    testing::FramedPeer daemon(socket_path_);
     ASSERT_TRUE(daemon.listening());
     SendCommandToDaemon("worker_create", data);
     SendCommandToDaemon("resume", Json::Value());
@@ -75,10 +76,10 @@ TEST_F(SendCommandTest, RetriesOnlyWhileTheSocketIsMissingAndLeavesSigpipeIgnore
 }
 
 TEST_F(SendCommandTest, SocketCreationFailureIsLoggedAndThrown) {
-#if defined(__SANITIZE_ADDRESS__)
-  // The sanitizers open descriptors of their own; with none left they report false errors.
-  GTEST_SKIP() << "needs free descriptors under the sanitizers";
-#endif
+  if (testing::kSanitized) {
+    // The sanitizers open descriptors of their own; with none left they report false errors.
+    GTEST_SKIP() << "needs free descriptors under the sanitizers";
+  }
   const int next_fd = ::dup(0);  // a descriptor limit at the next free number
   ASSERT_GE(next_fd, 0);
   ::close(next_fd);

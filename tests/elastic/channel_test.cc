@@ -22,7 +22,7 @@ namespace {
 
 using testing::BusyAnswer;
 using testing::CodeOf;
-using testing::ElasticPeer;
+using testing::FramedPeer;
 using testing::Options;
 
 class ChannelTest : public testing::ElasticTestRoot {
@@ -61,7 +61,7 @@ TEST_F(ChannelTest, RequestTravelsFramedAndTheAnswerComesBackParsed) {
 
 TEST_F(ChannelTest, BadAnswerIs913WithWhatWasParsedAndIsNotRetried) {
   struct Case {
-    ElasticPeer::Reply answer;
+    FramedPeer::Reply answer;
     std::string reason;
   };
   const std::vector<Case> cases = {
@@ -125,7 +125,7 @@ TEST_F(ChannelTest, BusyDaemonIsWaitedOutWithOneNoticeAfterTheTenthRetry) {
     next_random_ = 0;
     std::remove(NoticesPath().c_str());
     const size_t sent_before = peer_.requests().size();
-    peer_.Script(std::vector<ElasticPeer::Reply>(c.busy_answers, BusyAnswer(c.code)));
+    peer_.Script(std::vector<FramedPeer::Reply>(c.busy_answers, BusyAnswer(c.code)));
     Send(pause_);
     EXPECT_EQ(sent_before + c.busy_answers + 1, peer_.requests().size()) << shown;
     ASSERT_EQ(c.busy_answers, log.lines().size()) << shown;

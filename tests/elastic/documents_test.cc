@@ -21,7 +21,7 @@ namespace elastic {
 namespace {
 
 using testing::CodeOf;
-using testing::ElasticPeer;
+using testing::FramedPeer;
 using testing::Options;
 
 class DocumentsTest : public testing::ElasticTestRoot {
@@ -31,8 +31,8 @@ class DocumentsTest : public testing::ElasticTestRoot {
   // Answers each document_get_by_query from docs, by the prefix of its
   // "KALOMDPath" as the daemon does; anything else with success.
   void ServeQueries(const std::vector<Json::Value>& docs) {
-    peer_.SetResponder([docs](const Json::Value& req) -> ElasticPeer::Reply {
-      if (req["command"] != "document_get_by_query") return std::string(ElasticPeer::kSuccess);
+    peer_.SetResponder([docs](const Json::Value& req) -> FramedPeer::Reply {
+      if (req["command"] != "document_get_by_query") return std::string(FramedPeer::kSuccess);
       const std::string prefix = req["data"]["query"]["qsl"]["prefix"]["KALOMDPath"].asString();
       Json::Value answer;
       answer["success"] = true;
@@ -151,7 +151,7 @@ TEST_F(DocumentsTest, RenamedFileStillSendsAnEmptyCompoundRequest) {
 }
 
 TEST_F(DocumentsTest, QueryAnswerWithoutDocumentsIs916WithTheAnswer) {
-  peer_.Script({std::string(ElasticPeer::kSuccess), R"({"success": true, "data": {"n": 0}})"});
+  peer_.Script({std::string(FramedPeer::kSuccess), R"({"success": true, "data": {"n": 0}})"});
   std::string reason;
   EXPECT_EQ(916, CodeOf([] { IndexRename("s", "/v/s/a", "/v/s/b"); }, &reason));
   EXPECT_EQ(R"({"data":{"n":0},"success":true})", reason);

@@ -12,10 +12,10 @@
 #include <string>
 #include <vector>
 
-#include "elastic/elastic_peer.h"
 #include "orvex/elastic.h"
 #include "orvex/foundation/system_hooks.h"
 #include "platform/share_test_root.h"
+#include "support/framed_peer.h"
 #include "support/log_capture.h"
 #include "support/run_program.h"
 
@@ -52,7 +52,7 @@ class ElasticTestRoot : public ShareTestRoot {
     return hooks;
   }
 
-  ElasticPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
+  FramedPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
   std::vector<Wait> waits_;
   int next_random_ = 0;
   ScopedSystemHooks hooks_{InstantWaits()};

@@ -18,7 +18,6 @@
 #include <string>
 #include <vector>
 
-#include "elastic/elastic_peer.h"
 #include "kalo/kalo_notify.h"
 #include "orvex/communication.h"
 #include "orvex/config/folder_mgr.h"
@@ -29,6 +28,7 @@
 #include "orvex/portable/root.h"
 #include "orvex/status/status_mgr.h"
 #include "platform/share_test_root.h"
+#include "support/framed_peer.h"
 #include "support/log_capture.h"
 #include "support/run_program.h"
 
@@ -94,11 +94,11 @@ class IndexMgrTestRoot : public ShareTestRoot {
     elastic_.SetResponder([this](const Json::Value& request) {
       Record("elastic " + request["command"].asString() + " " + request["data"]["id"].asString(),
              request);
-      return ElasticPeer::Reply(ElasticPeer::kSuccess);
+      return FramedPeer::Reply(FramedPeer::kSuccess);
     });
     fileindexd_.SetResponder([this](const Json::Value& request) {
       Record("fileindexd " + request["type"].asString() + " " + toString(request["data"]), request);
-      return ElasticPeer::Reply(ElasticPeer::kSuccess);
+      return FramedPeer::Reply(FramedPeer::kSuccess);
     });
   }
 
@@ -227,8 +227,8 @@ class IndexMgrTestRoot : public ShareTestRoot {
   std::unique_ptr<ScopedEnv> ctl_env_;
   mutable std::mutex mutex_;
   std::vector<Step> timeline_;
-  ElasticPeer elastic_{dir_.Join("var/run/kaloelasticd.sock")};
-  ElasticPeer fileindexd_{dir_.Join("var/run/fileindexd.sock")};
+  FramedPeer elastic_{dir_.Join("var/run/kaloelasticd.sock")};
+  FramedPeer fileindexd_{dir_.Join("var/run/fileindexd.sock")};
   std::vector<unsigned long> sleeps_;
   ScopedSystemHooks hooks_{
       SystemHooks{nullptr, [this](unsigned long micros) { sleeps_.push_back(micros); }, nullptr}};

@@ -12,8 +12,8 @@
 #include <string>
 #include <thread>
 
-#include "elastic/elastic_peer.h"
 #include "orvex/communication.h"
+#include "support/framed_peer.h"
 #include "support/run_program.h"
 #include "support/temp_dir.h"
 
@@ -77,7 +77,7 @@ class FileindexdTest : public ::testing::Test {
   const std::string share_ = dir_.Join("volume1/s");
   const std::string docs_ = share_ + "/docs";
   const std::string socket_ = dir_.Join("var/run/fileindexd.sock");
-  testing::ElasticPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
+  testing::FramedPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
   pid_t pid_ = -1;
 };
 

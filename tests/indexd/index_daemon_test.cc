@@ -21,18 +21,18 @@
 #include <string>
 #include <vector>
 
-#include "elastic/elastic_peer.h"
 #include "orvex/communication.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"
 #include "platform/share_test_root.h"
+#include "support/framed_peer.h"
 #include "support/log_capture.h"
 
 namespace orvex {
 namespace indexd {
 namespace {
 
-using testing::ElasticPeer;
+using testing::FramedPeer;
 
 constexpr time_t kStart = 1700000000;
 constexpr int kMaxSteps = 2000;
@@ -45,10 +45,10 @@ class IndexDaemonTest : public testing::ShareTestRoot {
     std::filesystem::create_directories(docs_);
     std::filesystem::create_directories(root_ + "/@eaDir/@fileindex");
     queue_ = root_ + "/@eaDir/@fileindex/queue";
-    peer_.SetResponder([](const Json::Value& request) -> ElasticPeer::Reply {
+    peer_.SetResponder([](const Json::Value& request) -> FramedPeer::Reply {
       // A rename lists the moved item's descendants: there are none here.
       if (request["command"] == "document_get_by_query") return R"({"success":true,"data":[]})";
-      return std::string(ElasticPeer::kSuccess);
+      return std::string(FramedPeer::kSuccess);
     });
     WriteFolders(/*paused=*/false);
   }
@@ -190,7 +190,7 @@ class IndexDaemonTest : public testing::ShareTestRoot {
 
   time_t now_ = kStart;
   ScopedSystemHooks hooks_{FakeClock()};
-  ElasticPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
+  FramedPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
   testing::LogCapture log_;
   std::string root_, docs_, queue_;
   std::unique_ptr<IndexDaemon> daemon_;
@@ -262,9 +262,9 @@ TEST_F(IndexDaemonTest, ReindexReadsOnlyChangedFilesAndDeletesDocumentsOfVanishe
   answer["success"] = true;
   answer["data"] = known;
   const std::string text = toString(answer);
-  peer_.SetResponder([text](const Json::Value& request) -> ElasticPeer::Reply {
+  peer_.SetResponder([text](const Json::Value& request) -> FramedPeer::Reply {
     if (request["command"] == "document_get_by_query") return text;
-    return std::string(ElasticPeer::kSuccess);
+    return std::string(FramedPeer::kSuccess);
   });
   Append(queue_, Line(0x10000, docs_));
   Start();
@@ -286,9 +286,9 @@ TEST_F(IndexDaemonTest, ConfigurationChangeReadsEveryFileAgain) {
   answer["data"][0]["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
   answer["data"][0]["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
   const std::string text = toString(answer);
-  peer_.SetResponder([text](const Json::Value& request) -> ElasticPeer::Reply {
+  peer_.SetResponder([text](const Json::Value& request) -> FramedPeer::Reply {
     if (request["command"] == "document_get_by_query") return text;
-    return std::string(ElasticPeer::kSuccess);
+    return std::string(FramedPeer::kSuccess);
   });
   Append(queue_, R"({"event": 131072, "path": ")" + docs_ + R"(", "data": {"document": true}})");
   Start();
@@ -335,7 +335,7 @@ TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
   EXPECT_TRUE(Exists(queue_ + ".tmp"));
   EXPECT_EQ(daemon_->Status()["shares"]["s"]["state"], "retrying");
   EXPECT_EQ(daemon_->Status()["shares"]["s"]["todo"], 2);
-  ElasticPeer back(dir_.Join("var/run/kaloelasticd.sock"));
+  FramedPeer back(dir_.Join("var/run/kaloelasticd.sock"));
   now_ += 30;
   Drain();
   EXPECT_EQ(back.requests().size(), 3u);

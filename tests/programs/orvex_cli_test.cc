@@ -15,7 +15,7 @@
 
 #include "orvex/version.h"
 #include "programs/program_test.h"
-#include "status/fileindexd_peer.h"
+#include "support/framed_peer.h"
 
 namespace orvex {
 namespace testing {
@@ -366,7 +366,7 @@ TEST_F(OrvexCliTest, LinkedOrDirectoryStateFilesAreReportedAndKept) {
 
 TEST_F(OrvexCliTest, PauseSavesAndTellsTheDaemon) {
   fs::create_directories(Path("var/run"));
-  FileindexdPeer daemon(Path(kSocketRel));
+  FramedPeer daemon(Path(kSocketRel));
   ASSERT_TRUE(daemon.listening());
   const int64_t earliest = static_cast<int64_t>(::time(nullptr)) + 3 * 3600;
   const ProgramOutcome pause = Run({"pause", "3"});

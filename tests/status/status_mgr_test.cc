@@ -14,7 +14,7 @@
 #include "orvex/foundation/lock.h"
 #include "orvex/foundation/system_hooks.h"
 #include "orvex/portable/root.h"
-#include "status/fileindexd_peer.h"
+#include "support/framed_peer.h"
 #include "support/log_capture.h"
 #include "support/run_program.h"
 #include "support/temp_dir.h"
@@ -56,7 +56,7 @@ class StatusMgrTest : public ::testing::Test {
 TEST_F(StatusMgrTest, PauseStoresAndSendsItsEndAndResumeStoresRunning) {
   EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);
   EXPECT_FALSE(std::filesystem::exists(status_path_)) << "reading must not create the file";
-  testing::FileindexdPeer daemon(portable::RootPath(kFileIndexDaemonSockPath));
+  testing::FramedPeer daemon(portable::RootPath(kFileIndexDaemonSockPath));
   // The NAS adds in 32 bits: a pause ending after January 2038 wraps to a
   // negative time, and that is what is stored and sent.
   const Json::Int64 wrapped = Json::Int64{2147483000} + 3600 - (Json::Int64{1} << 32);
@@ -73,7 +73,7 @@ TEST_F(StatusMgrTest, PauseStoresAndSendsItsEndAndResumeStoresRunning) {
 }
 
 TEST_F(StatusMgrTest, FailedPauseChangesNothing) {
-  testing::FileindexdPeer daemon(portable::RootPath(kFileIndexDaemonSockPath));
+  testing::FramedPeer daemon(portable::RootPath(kFileIndexDaemonSockPath));
   testing::LogCapture log;
   Error error = ErrorOf([] { StatusMgr().Pause(-1); });
   EXPECT_EQ(error.code(), kErrorBadArgument);

@@ -42,6 +42,11 @@ std::string Line(unsigned event, bool is_dir, const std::string& path,
   return line + "}";
 }
 
+// The two lines of a file made and written: its create, then its modify.
+std::vector<std::string> Written(const std::string& path) {
+  return {Line(64, false, path), Line(2, false, path)};
+}
+
 class WatcherTest : public ::testing::Test {
  protected:
   void SetUp() override {
@@ -107,40 +112,28 @@ class WatcherTest : public ::testing::Test {
   int watch_fault_ = 0;  // errno for watches of directories named "full"
 };
 
-TEST_F(WatcherTest, RegistrationAddedWhileRunningIsWatchedAtOnce) {
+// Registrations are followed while the watcher runs: added, changed to
+// another folder list, removed.
+TEST_F(WatcherTest, RegistrationsAreFollowedWhileRunning) {
+  fs::create_directories(share_ + "/a");
+  fs::create_directories(share_ + "/b");
   WriteFile(share_ + "/before");
   Drain();
   EXPECT_FALSE(fs::exists(queue_));
-  Register({share_});
-  Drain();
-  WriteFile(share_ + "/a");
-  EXPECT_EQ(
-      (std::vector<std::string>{Line(64, false, share_ + "/a"), Line(2, false, share_ + "/a")}),
-      NewLines());
-}
-
-TEST_F(WatcherTest, RegistrationRemovedWhileRunningStopsTheLines) {
-  Register({share_});
-  Drain();
-  ASSERT_TRUE(MonitorQueue::Delete(queue_, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
-  Drain();
-  WriteFile(share_ + "/a");
-  EXPECT_TRUE(NewLines().empty());
-  EXPECT_EQ(0u, watcher_->watch_count());
-}
-
-TEST_F(WatcherTest, RegistrationChangedFollowsTheNewFolderList) {
-  fs::create_directories(share_ + "/a");
-  fs::create_directories(share_ + "/b");
   Register({share_ + "/a"});
   Drain();
+  WriteFile(share_ + "/a/x");
+  EXPECT_EQ(Written(share_ + "/a/x"), NewLines());
   Register({share_ + "/b"});
   Drain();
-  WriteFile(share_ + "/a/x");
+  WriteFile(share_ + "/a/y");
   WriteFile(share_ + "/b/y");
-  EXPECT_EQ(
-      (std::vector<std::string>{Line(64, false, share_ + "/b/y"), Line(2, false, share_ + "/b/y")}),
-      NewLines());
+  EXPECT_EQ(Written(share_ + "/b/y"), NewLines());
+  ASSERT_TRUE(MonitorQueue::Delete(queue_, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  Drain();
+  WriteFile(share_ + "/b/z");
+  EXPECT_TRUE(NewLines().empty());
+  EXPECT_EQ(0u, watcher_->watch_count());
 }
 
 TEST_F(WatcherTest, EachKindOfChangeHasItsLine) {
@@ -179,9 +172,7 @@ TEST_F(WatcherTest, RenamesArePairedAndLoneHalvesBecomeDeleteOrCreate) {
       NewLines());
   // The renamed directory's watches follow it.
   WriteFile(share_ + "/e/sub/z");
-  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/e/sub/z"),
-                                      Line(2, false, share_ + "/e/sub/z")}),
-            NewLines());
+  EXPECT_EQ(Written(share_ + "/e/sub/z"), NewLines());
 }
 
 TEST_F(WatcherTest, DirectoryMovedOutIsNoLongerWatchedAndMovedInIs) {
@@ -197,9 +188,7 @@ TEST_F(WatcherTest, DirectoryMovedOutIsNoLongerWatchedAndMovedInIs) {
       NewLines());
   WriteFile(outside + "/out/gone");
   WriteFile(share_ + "/in/deep/here");
-  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/in/deep/here"),
-                                      Line(2, false, share_ + "/in/deep/here")}),
-            NewLines());
+  EXPECT_EQ(Written(share_ + "/in/deep/here"), NewLines());
 }
 
 TEST_F(WatcherTest, EveryFileOfANewDirectoryReachesTheQueue) {
@@ -273,9 +262,7 @@ TEST_F(WatcherTest, NestedFoldersOfOneQueueTellEachChangeOnce) {
   Register({share_ + "/a", share_ + "/a/b"});
   Drain();
   WriteFile(share_ + "/a/b/f");
-  EXPECT_EQ((std::vector<std::string>{Line(64, false, share_ + "/a/b/f"),
-                                      Line(2, false, share_ + "/a/b/f")}),
-            NewLines());
+  EXPECT_EQ(Written(share_ + "/a/b/f"), NewLines());
 }
 
 TEST_F(WatcherTest, NamesWithAnyBytesStayOneValidLine) {
@@ -343,9 +330,7 @@ TEST_F(WatcherTest, FolderThatGoesAwayIsWatchedAgainWhenItReturns) {
   fs::create_directories(folder);
   EXPECT_EQ(std::vector<std::string>{Line(64, true, folder)}, NewLines());
   WriteFile(folder + "/back");
-  EXPECT_EQ((std::vector<std::string>{Line(64, false, folder + "/back"),
-                                      Line(2, false, folder + "/back")}),
-            NewLines());
+  EXPECT_EQ(Written(folder + "/back"), NewLines());
 }
 
 TEST_F(WatcherTest, FolderMissingAtRegistrationIsWatchedOnceItExists) {

@@ -1,12 +1,14 @@
-// ElasticPeer: a stand-in for the search daemon kaloelasticd in tests. It
-// listens on a Unix socket and, for each connection, reads one framed request
-// (a 4-byte host-order length, then JSON text ending in a NUL byte), records
-// it, and answers as its responder says: with a framed text, or by closing
-// without an answer. Requests are recorded before the answer goes out, so
-// once a client's call has returned its requests are visible. The responder
-// runs on the peer's thread; set it before the client starts.
-#ifndef ORVEX_TESTS_ELASTIC_ELASTIC_PEER_H_
-#define ORVEX_TESTS_ELASTIC_ELASTIC_PEER_H_
+// FramedPeer: a stand-in for a daemon that speaks the platform's framed
+// socket protocol (the search daemon kaloelasticd, the indexing daemon
+// fileindexd) in tests. It listens on a Unix socket and, for each connection,
+// reads one framed request (a 4-byte host-order length, then JSON text ending
+// in a NUL byte), records it, and answers as its responder says: with a
+// framed text, or by closing without an answer. Requests are recorded before
+// the answer goes out, so once a client's call has returned its requests are
+// visible. The responder runs on the peer's thread; set it before the client
+// starts.
+#ifndef ORVEX_TESTS_SUPPORT_FRAMED_PEER_H_
+#define ORVEX_TESTS_SUPPORT_FRAMED_PEER_H_
 
 #include <json/json.h>
 #include <sys/socket.h>
@@ -30,7 +32,7 @@
 namespace orvex {
 namespace testing {
 
-class ElasticPeer {
+class FramedPeer {
  public:
   // The answer text (framed with a NUL), or nullopt to close unanswered.
   using Reply = std::optional<std::string>;
@@ -38,7 +40,7 @@ class ElasticPeer {
 
   static constexpr char kSuccess[] = R"({"success": true})";
 
-  explicit ElasticPeer(const std::string& socket_path) : path_(socket_path) {
+  explicit FramedPeer(const std::string& socket_path) : path_(socket_path) {
     std::filesystem::create_directories(std::filesystem::path(path_).parent_path());
     listen_fd_ = ::socket(AF_UNIX, SOCK_STREAM, 0);
     struct sockaddr_un address;
@@ -50,9 +52,9 @@ class ElasticPeer {
                  ::listen(listen_fd_, 8) == 0;
     if (listening_) thread_ = std::thread([this] { Serve(); });
   }
-  ElasticPeer(const ElasticPeer&) = delete;
-  ElasticPeer& operator=(const ElasticPeer&) = delete;
-  ~ElasticPeer() { Stop(); }
+  FramedPeer(const FramedPeer&) = delete;
+  FramedPeer& operator=(const FramedPeer&) = delete;
+  ~FramedPeer() { Stop(); }
 
   // Stops listening and removes the socket: the daemon has gone away.
   void Stop() {
@@ -181,4 +183,4 @@ class ElasticPeer {
 }  // namespace testing
 }  // namespace orvex
 
-#endif  // ORVEX_TESTS_ELASTIC_ELASTIC_PEER_H_
+#endif  // ORVEX_TESTS_SUPPORT_FRAMED_PEER_H_
