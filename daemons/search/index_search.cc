@@ -1,4 +1,20 @@
 // IndexStore::Search: user searches over the committed state of one index.
+//
+// Each query takes the plan that reads the least for its page:
+// - a name fragment alone, in name order (the usual search): a fragment that
+//   matches many names is found by walking the folded-name index in order
+//   and keeping the matches, which stops at the page's end; one that matches
+//   few is looked up in name_grams and its matches sorted. Which one: for
+//   three code points or more, name_grams counts the matches up to a bound
+//   first; for a shorter one (a prefix query, which gathers every match
+//   before its first row) a sample of the names spread over the index tells.
+// - words: the matches are ordered by their keys alone (the best-ranked of a
+//   bounded set for "relevance"), and only the page's hits get a snippet.
+// - anything else: one SQL query over the filters.
+// Counting is bounded too: "total" is exact below the bound, and otherwise a
+// lower bound (SearchResult::exact).
+#include <algorithm>
+#include <cmath>
 #include <string>
 #include <vector>
 
@@ -10,13 +26,29 @@ namespace orvex {
 namespace search {
 namespace {
 
-// Fragments shorter than this cannot use the trigram index: they scan the
-// stored folded names instead.
+// Fragments shorter than this are prefix queries on name_grams, or a scan.
 constexpr size_t kTrigram = 3;
-// Above this many name matches, hits in name order are found by walking the
-// name index and keeping the matches (it stops at the page's end); below
-// it, fetching the matches and sorting them is cheaper.
-constexpr int64_t kWalkNameIndexAbove = 1000;
+// Matches are counted at least this far before "total" becomes a bound.
+constexpr int64_t kCountBound = 1000;
+// ... and at most this far, however deep the page.
+constexpr int64_t kMaxCountBound = 50000;
+// A walk of the name index reads at least this many times the count
+// bound's worth of entries before it gives up for a sort.
+constexpr int64_t kShortWalkFactor = 4;
+// A short fragment's share of the names is estimated on this many stretches
+// of this many documents, spread over the row ids (the order they came in,
+// which is not the name order: the walk's own start says little of the rest).
+constexpr int64_t kSampleStretches = 8;
+constexpr int64_t kSampleStretch = 250;
+// A text query sorted by relevance ranks at most this many matches (more
+// than the page asks): bm25 over every document holding a common word would
+// cost a pass over all of them.
+constexpr int64_t kRankedSet = 2000;
+
+constexpr char kHitColumns[] =
+    "d.path, d.name, d.type, d.is_dir, d.size, d.mtime, d.ctime, d.crtime, d.owner, "
+    "d.folded_name";
+constexpr int kHitColumnCount = 10;
 
 std::string Quoted(const std::string& text) {
   std::string out = "\"";
@@ -25,6 +57,12 @@ std::string Quoted(const std::string& text) {
     if (c == '"') out += '"';
   }
   return out + "\"";
+}
+
+// A folded fragment as a name_grams query: the phrase of its trigrams, or
+// a prefix of one token when it is shorter (see name_tokenizer.h).
+std::string NameMatch(const std::string& folded) {
+  return Quoted(folded) + (CodePointCount(folded) < kTrigram ? "*" : "");
 }
 
 // The user's words, "phrases" and prefix* as an FTS5 expression: every term
@@ -85,8 +123,11 @@ Filter BuildFilter(const SearchQuery& q, const std::string& folded_name) {
   };
   if (!q.text.empty()) text("words MATCH ?", TextMatch(q.text));
   if (!folded_name.empty()) {
+    // With other filters a short fragment scans: a prefix query for one
+    // common letter would first gather every name holding it.
     if (CodePointCount(folded_name) >= kTrigram) {
-      text("d.id IN (SELECT rowid FROM name_grams WHERE name_grams MATCH ?)", Quoted(folded_name));
+      text("d.id IN (SELECT rowid FROM name_grams WHERE name_grams MATCH ?)",
+           NameMatch(folded_name));
     } else {
       text("instr(d.folded_name, ?) > 0", folded_name);
     }
@@ -124,51 +165,231 @@ std::optional<int64_t> OptionalInt(const Statement& s, int column) {
   return s.Int(column);
 }
 
+// A hit from the kHitColumns at the start of a row.
+SearchHit ReadHit(const Statement& s) {
+  SearchHit hit;
+  hit.path = s.Text(0);
+  hit.name = s.Text(1);
+  hit.type = s.Text(2);
+  hit.is_dir = s.Int(3) != 0;
+  hit.size = OptionalInt(s, 4);
+  hit.mtime = OptionalInt(s, 5);
+  hit.ctime = OptionalInt(s, 6);
+  hit.crtime = OptionalInt(s, 7);
+  hit.owner = s.Text(8);
+  hit.folded_name = s.Text(9);
+  return hit;
+}
+
+// The matches of "SELECT 1 <from_where>", counted up to bound.
+int64_t CountUpTo(SqliteDb& db, const std::string& from_where, const Filter& f, int64_t bound) {
+  Statement count(db, "SELECT count(*) FROM (SELECT 1" + from_where + " LIMIT ?)");
+  count.Bind(Bind(count, f), bound);
+  count.Step();
+  return count.Int(0);
+}
+
+int64_t LastId(SqliteDb& db) {
+  Statement last(db, "SELECT max(id) FROM documents");  // the row count, near enough
+  last.Step();
+  return std::max<int64_t>(last.Int(0), 1);
+}
+
+// The count bound for a page ending at need. It is also where walking the
+// name index in order and sorting the matches cost the same: a walk reads
+// about need * documents / matches entries of the index, a sort every
+// match, so they meet at sqrt(need * documents) matches.
+int64_t CountBound(SqliteDb& db, int64_t need) {
+  const double documents = static_cast<double>(LastId(db));
+  const auto even = static_cast<int64_t>(std::sqrt(static_cast<double>(need) * documents));
+  return std::clamp(std::max(even, need), kCountBound, std::max(kMaxCountBound, need));
+}
+
+// The rows of ids, in that order.
+std::vector<SearchHit> HitsOf(SqliteDb& db, const std::vector<int64_t>& ids) {
+  std::vector<SearchHit> hits;
+  Statement get(db, std::string("SELECT ") + kHitColumns + " FROM documents d WHERE d.id = ?1");
+  for (const int64_t id : ids) {
+    get.Bind(1, id);
+    if (get.Step()) hits.push_back(ReadHit(get));
+    get.Reset();
+  }
+  return hits;
+}
+
+// The estimated number of names that hold folded, from a sample.
+int64_t EstimatedMatches(SqliteDb& db, const std::string& folded) {
+  const int64_t last = LastId(db);
+  Statement stretch(db, "SELECT folded_name FROM documents WHERE id >= ?1 ORDER BY id LIMIT ?2");
+  int64_t read = 0, matches = 0;
+  for (int64_t k = 0; k < kSampleStretches; ++k) {
+    stretch.Bind(1, last / kSampleStretches * k).Bind(2, kSampleStretch);
+    while (stretch.Step()) {
+      ++read;
+      matches += stretch.TextView(0).find(folded) != std::string_view::npos;
+    }
+    stretch.Reset();
+  }
+  return read == 0 ? 0 : matches * last / read;
+}
+
+// The folded-name index read in the query's order, keeping the names that
+// hold folded: at most budget entries, or fewer when the page is full and
+// count_to matches are counted.
+struct Walk {
+  std::vector<int64_t> page;  // the ids of the hits up to the page's end
+  int64_t matches = 0;        // among the entries read
+  bool reached_end = false;   // every entry was read: matches is the total
+  int64_t need = 0;
+
+  bool PageFull() const { return matches >= need || reached_end; }
+};
+
+Walk WalkNameIndex(SqliteDb& db, const SearchQuery& q, const std::string& folded, int64_t budget,
+                   int64_t count_to) {
+  const std::string dir = q.descending ? " DESC" : "";
+  Statement walk(db,
+                 "SELECT id, folded_name FROM documents INDEXED BY documents_folded_name "
+                 "ORDER BY folded_name" +
+                     dir + ", path" + dir);
+  const int64_t need = q.offset + q.limit;
+  Walk w;
+  w.need = need;
+  for (int64_t read = 1;; ++read) {
+    if (!walk.Step()) {
+      w.reached_end = true;
+      break;
+    }
+    if (walk.TextView(1).find(folded) != std::string_view::npos && ++w.matches <= need) {
+      w.page.push_back(walk.Int(0));
+    }
+    // Past the budget with the page still short: the matches lie further on
+    // in name order, and sorting them is the cheaper way.
+    if (read >= budget && w.matches < need) break;
+    if (w.matches >= need && (w.matches >= count_to || read >= budget)) break;
+  }
+  return w;
+}
+
+// The page of a fragment's matches found through name_grams, sorted.
+std::vector<SearchHit> SortedNameMatches(SqliteDb& db, const SearchQuery& q,
+                                         const std::string& match) {
+  const std::string dir = q.descending ? " DESC" : "";
+  Statement rows(db, std::string("SELECT ") + kHitColumns +
+                         " FROM name_grams CROSS JOIN documents d ON d.id = name_grams.rowid "
+                         "WHERE name_grams MATCH ?1 ORDER BY d.folded_name" +
+                         dir + ", d.path" + dir + " LIMIT ?2");
+  rows.Bind(1, match).Bind(2, q.offset + q.limit);
+  std::vector<SearchHit> hits;
+  while (rows.Step()) hits.push_back(ReadHit(rows));
+  return hits;
+}
+
+// How many entries of the name index a walk may read before sorting the
+// matches instead: sorting costs about one entry's read per match, so as
+// many as there are matches (estimated), and never less than a few bounds.
+int64_t WalkBudget(SqliteDb& db, const std::string& folded, int64_t bound) {
+  return std::max(kShortWalkFactor * bound, EstimatedMatches(db, folded));
+}
+
+SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& folded) {
+  const int64_t bound = CountBound(db, q.offset + q.limit);
+  const std::string match = NameMatch(folded);
+  Filter by_name;
+  by_name.text_args.push_back(match);
+  const std::string grams = " FROM name_grams WHERE name_grams MATCH ?";
+  SearchResult result;
+  if (CodePointCount(folded) >= kTrigram) {
+    result.total = CountUpTo(db, grams, by_name, bound);
+    if (result.total < bound) {
+      result.hits = SortedNameMatches(db, q, match);
+      return result;
+    }
+    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(db, folded, bound), 0);
+    result.hits = w.PageFull() ? HitsOf(db, w.page) : SortedNameMatches(db, q, match);
+    result.exact = false;
+    return result;
+  }
+  // A prefix query gathers every match before its first row: only for
+  // fragments that look rare, or whose matches the walk did not reach.
+  if (EstimatedMatches(db, folded) >= bound) {
+    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(db, folded, bound), bound);
+    if (w.PageFull()) {
+      result.hits = HitsOf(db, w.page);
+      result.total = w.matches;
+      result.exact = w.reached_end;
+      return result;
+    }
+  }
+  result.total = CountUpTo(db, grams, by_name, bound);
+  result.exact = result.total < bound;
+  result.hits = SortedNameMatches(db, q, match);
+  return result;
+}
+
+// Words: the page's ids by the query's order first, then a snippet for
+// each of them alone.
+SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
+  const int64_t need = q.offset + q.limit;
+  const std::string from = " FROM words CROSS JOIN documents d ON d.id = words.rowid WHERE 1";
+  SearchResult result;
+  const int64_t bound = std::max(kCountBound, need);
+  result.total = CountUpTo(db, from + f.where, f, bound);
+  result.exact = result.total < bound;
+  const std::string dir = q.descending ? " DESC" : "";
+  Statement order(
+      db, q.sort == "relevance"
+              ? "SELECT id, r FROM (SELECT d.id AS id, d.path AS path, words.rank AS r" + from +
+                    f.where + " LIMIT ?) ORDER BY r" + dir + ", path" + dir + " LIMIT ?"
+              : "SELECT d.id, 0" + from + f.where + OrderBy(q, true) + " LIMIT ?");
+  int next = Bind(order, f);
+  if (q.sort == "relevance") order.Bind(next++, std::max(kRankedSet, need));
+  order.Bind(next, need);
+  std::vector<std::pair<int64_t, double>> page;
+  while (order.Step()) page.emplace_back(order.Int(0), order.Double(1));
+  Statement snippet(db, std::string("SELECT ") + kHitColumns +
+                            ", snippet(words, -1, '[', ']', '...', 12)" + from +
+                            " AND words MATCH ?1 AND words.rowid = ?2");
+  for (const auto& [id, rank] : page) {
+    snippet.Bind(1, f.text_args.front()).Bind(2, id);
+    if (snippet.Step()) {
+      result.hits.push_back(ReadHit(snippet));
+      result.hits.back().snippet = snippet.Text(kHitColumnCount);
+      result.hits.back().rank = rank;
+    }
+    snippet.Reset();
+  }
+  return result;
+}
+
+bool NameAlone(const SearchQuery& q, const std::string& folded) {
+  return !folded.empty() && q.text.empty() && q.type.empty() && q.extension.empty() &&
+         q.owner.empty() && q.folder.empty() && !q.size_min && !q.size_max && !q.mtime_min &&
+         !q.mtime_max && q.sort == "name";
+}
+
 }  // namespace
 
 SearchResult IndexStore::Search(const SearchQuery& q) {
-  const bool has_text = !q.text.empty();
   const std::string folded = FoldCase(q.name);
+  if (NameAlone(q, folded)) return NameInOrder(*reader_, q, folded);
   const Filter f = BuildFilter(q, folded);
-  const bool by_trigram = CodePointCount(folded) >= kTrigram;
-  // The name alone: the trigram index counts its matches without visiting
-  // a single document.
-  const bool name_only = by_trigram && f.int_args.empty() && f.text_args.size() == 1;
-  std::string from = has_text ? " FROM words JOIN documents d ON d.id = words.rowid WHERE 1"
-                              : " FROM documents d WHERE 1";
+  if (!q.text.empty()) return ByWords(*reader_, q, f);
+  const int64_t need = q.offset + q.limit;
+  const int64_t bound = CountBound(*reader_, need);
+  std::string from = " FROM documents d WHERE 1";
   SearchResult result;
-  Statement count(*reader_, name_only ? "SELECT count(*) FROM name_grams WHERE name_grams MATCH ?"
-                                      : "SELECT count(*)" + from + f.where);
-  Bind(count, f);
-  count.Step();
-  result.total = count.Int(0);
-  count.Reset();
-  if (by_trigram && !has_text && q.sort == "name" && result.total > kWalkNameIndexAbove) {
+  result.total = CountUpTo(*reader_, from + f.where, f, bound);
+  result.exact = result.total < bound;
+  // Many matches in name order: the name index read in order stops at the
+  // page's end.
+  if (CodePointCount(folded) >= kTrigram && q.sort == "name" && !result.exact) {
     from = " FROM documents d INDEXED BY documents_folded_name WHERE 1";
   }
-  const std::string snippet = has_text ? "snippet(words, -1, '[', ']', '...', 12), rank" : "'', 0";
-  Statement rows(*reader_,
-                 "SELECT d.path, d.name, d.type, d.is_dir, d.size, d.mtime, d.ctime, d.crtime, "
-                 "d.owner, d.folded_name, " +
-                     snippet + from + f.where + OrderBy(q, has_text) + " LIMIT ?");
-  const int next = Bind(rows, f);
-  rows.Bind(next, q.offset + q.limit);
-  while (rows.Step()) {
-    SearchHit hit;
-    hit.path = rows.Text(0);
-    hit.name = rows.Text(1);
-    hit.type = rows.Text(2);
-    hit.is_dir = rows.Int(3) != 0;
-    hit.size = OptionalInt(rows, 4);
-    hit.mtime = OptionalInt(rows, 5);
-    hit.ctime = OptionalInt(rows, 6);
-    hit.crtime = OptionalInt(rows, 7);
-    hit.owner = rows.Text(8);
-    hit.folded_name = rows.Text(9);
-    hit.snippet = rows.Text(10);
-    hit.rank = rows.Double(11);
-    result.hits.push_back(std::move(hit));
-  }
+  Statement rows(*reader_, std::string("SELECT ") + kHitColumns + from + f.where +
+                               OrderBy(q, false) + " LIMIT ?");
+  rows.Bind(Bind(rows, f), need);
+  while (rows.Step()) result.hits.push_back(ReadHit(rows));
   return result;
 }
 

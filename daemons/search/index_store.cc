@@ -10,6 +10,7 @@
 #include "orvex/policy/file_type.h"
 #include "search/case_fold.h"
 #include "search/json_text.h"
+#include "search/name_tokenizer.h"
 #include "search/search_error.h"
 
 namespace orvex {
@@ -65,7 +66,8 @@ CREATE TABLE IF NOT EXISTS contents(id INTEGER PRIMARY KEY, text TEXT NOT NULL, 
 CREATE TABLE IF NOT EXISTS unindexed_names(id INTEGER PRIMARY KEY);
 CREATE TABLE IF NOT EXISTS unindexed_words(id INTEGER PRIMARY KEY);
 CREATE VIRTUAL TABLE IF NOT EXISTS name_grams USING fts5(
-  folded_name, content='documents', content_rowid='id', tokenize='trigram case_sensitive 1');
+  folded_name, content='documents', content_rowid='id', tokenize='orvex_name_grams',
+  columnsize=0);
 CREATE VIRTUAL TABLE IF NOT EXISTS words USING fts5(
   text, props, content='contents', content_rowid='id',
   tokenize='unicode61 remove_diacritics 2');
@@ -200,6 +202,23 @@ void ExecPragmas(SqliteDb& db) {
   db.Exec("PRAGMA temp_store=MEMORY");
 }
 
+// Creates what is missing of the schema. A name index of an earlier layout
+// (another tokenizer) is built again from the documents, in one transaction.
+bool NameIndexOfAnotherLayout(SqliteDb& db) {
+  Statement old(db, "SELECT sql FROM sqlite_master WHERE name = 'name_grams'");
+  return old.Step() && old.Text(0).find(kNameTokenizer) == std::string::npos;
+}
+
+void CreateSchema(SqliteDb& db) {
+  if (!NameIndexOfAnotherLayout(db)) {
+    db.Exec(kSchema);
+    return;
+  }
+  db.Exec("BEGIN IMMEDIATE; DROP TABLE name_grams;");
+  db.Exec(kSchema);
+  db.Exec("INSERT INTO name_grams(name_grams) VALUES ('rebuild'); COMMIT;");
+}
+
 }  // namespace
 
 std::string PrefixUpperBound(const std::string& prefix) {
@@ -213,6 +232,10 @@ struct IndexStore::Row {
   std::string path, parent, name, folded_name, type, extension, owner, body, text, props;
   bool is_dir = false;
   std::optional<int64_t> size, mtime, ctime, crtime;
+
+  // Most documents (names and attributes) have no words: they get no
+  // contents row, which saves a row, its note and its full-text pass.
+  bool HasWords() const { return !text.empty() || !props.empty(); }
 };
 
 struct IndexStore::Statements {
@@ -229,8 +252,10 @@ struct IndexStore::Statements {
                "crtime = ?11, owner = ?12, body = ?13 WHERE id = ?14"),
         insert_content(w, "INSERT INTO contents(id, text, props) VALUES (?1, ?2, ?3)"),
         update_content(w,
-                       "UPDATE contents SET text = ?2, props = ?3 WHERE id = ?1 AND "
-                       "(text IS NOT ?2 OR props IS NOT ?3)"),
+                       "INSERT INTO contents(id, text, props) VALUES (?1, ?2, ?3) "
+                       "ON CONFLICT(id) DO UPDATE SET text = ?2, props = ?3 "
+                       "WHERE text IS NOT ?2 OR props IS NOT ?3"),
+        remove_content(w, "DELETE FROM contents WHERE id = ?1"),
         remove(w, "DELETE FROM documents WHERE id = ?1"),
         remove_prefix(w, "DELETE FROM documents WHERE path >= ?1 AND path < ?2"),
         get_prefix(w, "SELECT body FROM documents WHERE path >= ?1 AND path < ?2 ORDER BY path"),
@@ -248,9 +273,9 @@ struct IndexStore::Statements {
         forget_words(w, "DELETE FROM unindexed_words"),
         commit(w, "COMMIT"),
         rollback(w, "ROLLBACK") {}
-  Statement find, load, insert, update, insert_content, update_content, remove, remove_prefix,
-      get_prefix, begin, savepoint, release, rollback_to, index_names, forget_names, index_words,
-      forget_words, commit, rollback;
+  Statement find, load, insert, update, insert_content, update_content, remove_content, remove,
+      remove_prefix, get_prefix, begin, savepoint, release, rollback_to, index_names, forget_names,
+      index_words, forget_words, commit, rollback;
 };
 
 IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
@@ -261,9 +286,11 @@ IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
       throw SearchError(kStorage, "cannot create the directory of " + path + ": " + ec.message());
   }
   writer_ = std::make_unique<SqliteDb>(path, create);
+  RegisterNameTokenizer(writer_->handle());
   ExecPragmas(*writer_);
-  writer_->Exec(kSchema);
+  CreateSchema(*writer_);
   reader_ = std::make_unique<SqliteDb>(path, /*create=*/false);
+  RegisterNameTokenizer(reader_->handle());
   reader_->Exec("PRAGMA busy_timeout=5000");
   st_ = std::make_unique<Statements>(*writer_);
   LoadMappings();
@@ -446,6 +473,7 @@ void IndexStore::Insert(const Row& row) {
   BindOptional(s, 10, row.ctime);
   BindOptional(s, 11, row.crtime);
   s.Bind(12, row.owner).Bind(13, row.body).Run();
+  if (!row.HasWords()) return;
   st_->insert_content.Bind(1, writer_->LastInsertRowid()).Bind(2, row.text).Bind(3, row.props);
   st_->insert_content.Run();
 }
@@ -459,12 +487,23 @@ void IndexStore::Update(int64_t id, const Row& row) {
   BindOptional(s, 11, row.crtime);
   s.Bind(12, row.owner).Bind(13, row.body).Bind(14, id).Run();
   // Only when the words changed: a rename must not re-index a book's text.
-  st_->update_content.Bind(1, id).Bind(2, row.text).Bind(3, row.props).Run();
+  if (row.HasWords()) {
+    st_->update_content.Bind(1, id).Bind(2, row.text).Bind(3, row.props).Run();
+  } else {
+    st_->remove_content.Bind(1, id).Run();
+  }
 }
 
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc) {
   CheckTypes(doc);
   const Row row = MakeRow(doc_id, doc);
+  Begin();
+  // A new document without words is one statement, which SQLite makes whole
+  // or undoes by itself: no savepoint around it.
+  if (!row.HasWords() && !FindId(doc_id) && (row.path == doc_id || !FindId(row.path))) {
+    Insert(row);
+    return;
+  }
   Atomically([&] {
     // A document sent again keeps its row, and its full-text entries when
     // its name and words did not change: re-indexing a share rewrites no

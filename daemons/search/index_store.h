@@ -49,7 +49,11 @@ struct SearchHit {
 };
 
 struct SearchResult {
+  // The matches, counted up to a bound: when exact is false there are at
+  // least this many (a search stops counting where more would cost more
+  // than finding the page).
   int64_t total = 0;
+  bool exact = true;
   std::vector<SearchHit> hits;
 };
 
@@ -90,8 +94,8 @@ class IndexStore {
   bool InTransaction() const;
 
   // Up to offset + limit best hits by the query's order (the caller slices:
-  // hits of several indexes are merged first), and the total count. Only
-  // committed documents.
+  // hits of several indexes are merged first), and the count of matches,
+  // exact or a lower bound. Only committed documents.
   SearchResult Search(const SearchQuery& query);
 
   // Document count, committed, and the database's size in bytes.

@@ -19,6 +19,9 @@ namespace search {
 namespace {
 
 constexpr int64_t kMaxLimit = 1000;
+// How far one search reaches (offset + limit): every index gives that many
+// hits before they are merged, so the bound is the answer's memory bound.
+constexpr int64_t kMaxReach = 10000;
 
 const Json::Value& Member(const Json::Value& data, const char* key) {
   if (!data.isMember(key)) throw SearchError(kBadArgument, std::string("missing \"") + key + "\"");
@@ -47,6 +50,25 @@ std::string AbsolutePathArg(const Json::Value& data, const char* key) {
   return path;
 }
 
+// A database path as the client composes it for a share P:
+// P/@eaDir/@fileindex/db, in the share's metadata folder, without "." or ".."
+// steps. The daemon creates, moves and removes files only at such paths,
+// never over a file of the system.
+std::string DatabasePathArg(const Json::Value& data, const char* key) {
+  static constexpr char kTail[] = "/@eaDir/@fileindex/db";
+  const std::string path = AbsolutePathArg(data, key);
+  const size_t tail = path.size() - std::min(path.size(), sizeof(kTail) - 1);
+  bool ok = tail > 0 && path.compare(tail, std::string::npos, kTail) == 0;
+  for (const char* step : {"/./", "/../", "//"}) {
+    ok = ok && (path + "/").find(step) == std::string::npos;
+  }
+  if (!ok) {
+    throw SearchError(kBadArgument, std::string("\"") + key + "\" must be a share's index path " +
+                                        "(/share/@eaDir/@fileindex/db), not " + path);
+  }
+  return path;
+}
+
 // {"qsl": {"prefix": {"KALOMDPath": prefix}}}: the one query the indexer sends.
 std::string PrefixQueryArg(const Json::Value& data) {
   const Json::Value& query = ObjectArg(data, "query");
@@ -60,7 +82,7 @@ std::string PrefixQueryArg(const Json::Value& data) {
 
 std::optional<int64_t> OptionalIntArg(const Json::Value& data, const char* key) {
   if (!data.isMember(key) || data[key].isNull()) return std::nullopt;
-  if (!data[key].isIntegral()) {
+  if (!data[key].isInt64()) {
     throw SearchError(kBadArgument, std::string("\"") + key + "\" must be an integer");
   }
   return data[key].asInt64();
@@ -71,10 +93,36 @@ std::string OptionalStringArg(const Json::Value& data, const char* key) {
   return StringArg(data, key);
 }
 
+// Bounds on a search's strings. Each word of a text query is one more
+// full-text lookup joined with the others (10,000 words take a second), and
+// no file name is longer than 255 bytes, so no longer fragment can match.
+constexpr size_t kMaxTextWords = 100;
+constexpr size_t kMaxNameBytes = 1024;
+
+// The words of a text query, phrases counted word by word.
+size_t WordCount(const std::string& text) {
+  size_t words = 0;
+  bool in_word = false;
+  for (const char c : text) {
+    const bool separator = c == ' ' || c == '\t' || c == '"';
+    if (!separator && !in_word) ++words;
+    in_word = !separator;
+  }
+  return words;
+}
+
 SearchQuery ParseQuery(const Json::Value& data) {
   SearchQuery q;
   q.name = OptionalStringArg(data, "name");
   q.text = OptionalStringArg(data, "text");
+  if (q.name.size() > kMaxNameBytes) {
+    throw SearchError(kBadArgument,
+                      "\"name\" is longer than " + std::to_string(kMaxNameBytes) + " bytes");
+  }
+  if (WordCount(q.text) > kMaxTextWords) {
+    throw SearchError(kBadArgument,
+                      "\"text\" has more than " + std::to_string(kMaxTextWords) + " words");
+  }
   q.type = OptionalStringArg(data, "type");
   q.extension = OptionalStringArg(data, "extension");
   q.folder = OptionalStringArg(data, "folder");
@@ -97,9 +145,10 @@ SearchQuery ParseQuery(const Json::Value& data) {
   q.descending = order == "desc";
   q.offset = OptionalIntArg(data, "offset").value_or(0);
   q.limit = OptionalIntArg(data, "limit").value_or(50);
-  if (q.offset < 0 || q.limit < 0 || q.limit > kMaxLimit) {
-    throw SearchError(kBadArgument,
-                      "\"offset\" must be >= 0 and \"limit\" 0 to " + std::to_string(kMaxLimit));
+  if (q.offset < 0 || q.limit < 0 || q.limit > kMaxLimit || q.offset > kMaxReach - q.limit) {
+    throw SearchError(kBadArgument, "\"offset\" must be >= 0, \"limit\" 0 to " +
+                                        std::to_string(kMaxLimit) + ", and their sum at most " +
+                                        std::to_string(kMaxReach));
   }
   return q;
 }
@@ -136,28 +185,47 @@ Json::Value HitJson(const SearchHit& hit, const std::string& id) {
   return out;
 }
 
-// The hits of store that viewer may read: pages grow until the page asked for
-// is full or the matches run out. "total" is exact when they ran out, and
-// otherwise counts the unread matches beyond the last page fetched.
-SearchResult ReadableHits(IndexStore& store, const SearchQuery& q, const Viewer& viewer) {
+// Matches examined at most, per index, for a user of a share that hides
+// unreadable entries: each costs a stat, and one search must not walk a
+// whole share. Never below the reach, or a page could not be filled.
+constexpr int64_t kMaxExamined = kMaxReach;
+
+// The hits of store that viewer may read. Matches are examined in the
+// query's order, in growing pages, until the page asked for is full or they
+// run out; "total" counts only the readable matches among those examined, so
+// that it tells nothing of the hidden ones, and exact says whether every
+// match was examined.
+SearchResult ReadableHits(IndexStore& store, const SearchQuery& q, const Viewer& viewer,
+                          const std::string& share_root, bool& exact) {
+  ReadCheck check(viewer, share_root);
   const int64_t need = q.offset + q.limit;
   SearchQuery page = q;
   page.offset = 0;
-  page.limit = std::max<int64_t>(need, 16);
+  // A quarter more than asked: a few hidden entries among the first do not
+  // cost a second search.
+  page.limit = std::min(need + need / 4 + 16, kMaxExamined);
+  std::vector<bool> readable;  // of the matches examined so far, in order
   for (;;) {
     SearchResult result = store.Search(page);
+    // A larger page starts with the same matches: only the new ones are checked.
+    for (size_t i = readable.size(); i < result.hits.size(); ++i) {
+      readable.push_back(check.CanRead(result.hits[i].path));
+    }
     const int64_t fetched = static_cast<int64_t>(result.hits.size());
-    const auto unreadable =
-        std::remove_if(result.hits.begin(), result.hits.end(),
-                       [&](const SearchHit& hit) { return !CanRead(hit.path, viewer); });
-    const int64_t hidden = result.hits.end() - unreadable;
-    result.hits.erase(unreadable, result.hits.end());
-    const bool exhausted = fetched < page.limit;
-    if (exhausted || static_cast<int64_t>(result.hits.size()) >= need) {
-      result.total -= hidden;
+    const int64_t seen = std::count(readable.begin(), readable.end(), true);
+    exact = fetched < page.limit || (result.exact && fetched >= result.total);
+    if (exact || seen >= need || page.limit >= kMaxExamined) {
+      size_t kept = 0;
+      for (size_t i = 0; i < result.hits.size(); ++i) {
+        if (!readable[i]) continue;
+        if (kept != i) result.hits[kept] = std::move(result.hits[i]);
+        ++kept;
+      }
+      result.hits.resize(kept);
+      result.total = seen;
       return result;
     }
-    page.limit *= 4;
+    page.limit = std::min(page.limit * 4, kMaxExamined);
   }
 }
 
@@ -254,6 +322,15 @@ Json::Value SearchEngine::Dispatch(const Json::Value& request, const Caller& cal
   return answer;
 }
 
+IndexStore& SearchEngine::WritableStore(const std::string& id) {
+  const IndexRecord* record = registry_.Find(id);
+  if (record != nullptr && record->paused) {
+    throw SearchError(kIndexPaused,
+                      "index \"" + id + "\" is paused: resume it to change documents");
+  }
+  return Store(id);
+}
+
 IndexStore& SearchEngine::Store(const std::string& id) {
   const auto it = open_.find(id);
   if (it != open_.end()) return *it->second;
@@ -274,7 +351,7 @@ void SearchEngine::CloseStore(const std::string& id) {
 
 Json::Value SearchEngine::IndexCreate(const Json::Value& data) {
   const std::string id = CheckIndexId(Member(data, "id"));
-  const std::string path = AbsolutePathArg(data, "path");
+  const std::string path = DatabasePathArg(data, "path");
   if (data.isMember("mappings") && !data["mappings"].isObject()) {
     throw SearchError(kBadArgument, "\"mappings\" must be an object");
   }
@@ -312,10 +389,14 @@ Json::Value SearchEngine::IndexDelete(const Json::Value& data) {
   return Json::Value(Json::objectValue);
 }
 
+// A pause first makes durable what was sent before it: the index then holds
+// still, with nothing pending, until the resume.
 Json::Value SearchEngine::IndexPause(const Json::Value& data, bool paused) {
   const std::string id = CheckIndexId(Member(data, "id"));
   const IndexRecord* record = registry_.Find(id);
   if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
+  const auto open = open_.find(id);
+  if (paused && open != open_.end()) open->second->Commit();
   if (record->paused != paused) registry_.Put(id, {record->path, paused});
   return Json::Value(Json::objectValue);
 }
@@ -329,7 +410,7 @@ Json::Value SearchEngine::IndexConfigSet(const Json::Value& data) {
   if (record == nullptr) throw SearchError(kNoSuchIndex, "no index \"" + id + "\"");
   const std::string new_id = change.isMember("id") ? CheckIndexId(change["id"]) : id;
   const std::string new_path =
-      change.isMember("path") ? AbsolutePathArg(change, "path") : record->path;
+      change.isMember("path") ? DatabasePathArg(change, "path") : record->path;
   if (new_id != id && registry_.Find(new_id) != nullptr) {
     throw SearchError(kIndexExists, "index \"" + new_id + "\" exists");
   }
@@ -357,7 +438,7 @@ Json::Value SearchEngine::DocumentWrite(const Json::Value& data, bool merge) {
   const std::string doc_id = StringArg(data, "doc_id");
   if (doc_id.empty()) throw SearchError(kBadArgument, "\"doc_id\" must not be empty");
   const Json::Value& doc = ObjectArg(data, "data");
-  IndexStore& store = Store(id);
+  IndexStore& store = WritableStore(id);
   if (merge) {
     store.Set(doc_id, doc);
   } else {
@@ -370,14 +451,14 @@ Json::Value SearchEngine::DocumentDelete(const Json::Value& data) {
   const std::string id = CheckIndexId(Member(data, "id"));
   const std::string doc_id = StringArg(data, "doc_id");
   Json::Value answer;
-  answer["data"]["deleted"] = Store(id).Delete(doc_id) ? 1 : 0;
+  answer["data"]["deleted"] = WritableStore(id).Delete(doc_id) ? 1 : 0;
   return answer;
 }
 
 Json::Value SearchEngine::DocumentQuery(const Json::Value& data, bool remove) {
   const std::string id = CheckIndexId(Member(data, "id"));
   const std::string prefix = PrefixQueryArg(data);
-  IndexStore& store = Store(id);
+  IndexStore& store = remove ? WritableStore(id) : Store(id);
   Json::Value answer;
   if (remove) {
     answer["data"]["deleted"] = static_cast<Json::Int64>(store.DeleteByPrefix(prefix));
@@ -405,11 +486,16 @@ Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) 
   const Viewer viewer = ResolveViewer(data, caller);
   std::vector<std::pair<SearchHit, std::string>> hits;
   int64_t total = 0;
+  bool exact = true;  // false when "total" counts only the matches examined
   for (const std::string& id : ids) {
-    const Visibility visibility = IndexVisibility(id, viewer);
-    if (visibility == Visibility::kNone) continue;
-    SearchResult result =
-        visibility == Visibility::kAll ? Store(id).Search(q) : ReadableHits(Store(id), q, viewer);
+    const IndexAccess access = IndexVisibility(id, viewer);
+    if (access.visibility == Visibility::kNone) continue;
+    bool index_exact = true;
+    SearchResult result = access.visibility == Visibility::kAll
+                              ? Store(id).Search(q)
+                              : ReadableHits(Store(id), q, viewer, access.share_root, index_exact);
+    if (access.visibility == Visibility::kAll) index_exact = result.exact;
+    exact = exact && index_exact;
     total += result.total;
     for (SearchHit& hit : result.hits) hits.emplace_back(std::move(hit), id);
   }
@@ -417,6 +503,7 @@ Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) 
                    [&](const auto& a, const auto& b) { return Before(a.first, b.first, q); });
   Json::Value answer;
   answer["data"]["total"] = static_cast<Json::Int64>(total);
+  answer["data"]["total_exact"] = exact;
   answer["data"]["hits"] = Json::Value(Json::arrayValue);
   const size_t begin = std::min(hits.size(), static_cast<size_t>(q.offset));
   const size_t end = std::min(hits.size(), begin + static_cast<size_t>(q.limit));

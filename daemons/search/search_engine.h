@@ -58,6 +58,8 @@ class SearchEngine {
 
   // The open store of index id; throws kNoSuchIndex.
   IndexStore& Store(const std::string& id);
+  // The same for a document write: throws kIndexPaused when it is paused.
+  IndexStore& WritableStore(const std::string& id);
   void CloseStore(const std::string& id);
 
   IndexRegistry registry_;

@@ -25,6 +25,7 @@ enum SearchCode : int {
   kStorage = 1108,         // SQLite or the file system failed
   kNotPermitted = 1109,    // a user asked to search as someone else
   kAnswerTooLarge = 1110,  // the answer would not fit one frame
+  kIndexPaused = 1111,     // a document write to a paused index
   kBusy = 1400,            // over the memory bound: try again later
 };
 

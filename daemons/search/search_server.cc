@@ -24,6 +24,9 @@ namespace {
 
 constexpr size_t kHeaderBytes = sizeof(uint32_t);
 constexpr size_t kReadChunk = 64 << 10;
+// How long the listening socket rests when the process is out of
+// descriptors: the clients wait in the backlog meanwhile.
+constexpr std::chrono::milliseconds kAcceptBackOff(200);
 
 bool FillAddress(const std::string& path, struct sockaddr_un& address) {
   std::memset(&address, 0, sizeof(address));
@@ -130,6 +133,10 @@ void SearchServer::Release(Connection& c) {
 void SearchServer::Accept() {
   while (connections_.size() < options_.max_connections) {
     FileDescriptor fd(::accept4(listen_.get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+    if (!fd && (errno == EMFILE || errno == ENFILE)) {
+      accept_paused_until_ = Now() + kAcceptBackOff;
+      return;
+    }
     if (!fd) return;  // EAGAIN, or a client gone before we got to it
     struct ucred cred;
     socklen_t size = sizeof(cred);
@@ -139,7 +146,7 @@ void SearchServer::Accept() {
     c.fd = std::move(fd);
     c.caller.uid = cred.uid;
     c.caller.gid = cred.gid;
-    c.last_activity = Clock::now();
+    c.last_activity = Now();
   }
 }
 
@@ -184,13 +191,18 @@ void SearchServer::OnFrame(Connection& c) {
   c.body = std::string();
   Release(c);
   c.length = 0;
-  if (!body.empty() && body.back() == '\0') body.pop_back();
-  Json::Value request;
+  // The NUL ends the text: one anywhere else means the sender framed
+  // something other than a request.
   Json::Value answer;
-  if (!fromString(request, body)) {
-    answer = SearchEngine::ErrorAnswer(kBadJson, "the request is not JSON text");
+  if (body.empty() || body.find('\0') != body.size() - 1) {
+    answer =
+        SearchEngine::ErrorAnswer(kBadJson, "the request must be JSON text ending in one NUL byte");
   } else {
-    answer = engine_.Handle(request, c.caller);
+    body.pop_back();
+    Json::Value request;
+    answer = fromString(request, body)
+                 ? engine_.Handle(request, c.caller)
+                 : SearchEngine::ErrorAnswer(kBadJson, "the request is not JSON text");
   }
   Answer(c, JsonText(answer), /*close_after=*/false);
 }
@@ -227,7 +239,7 @@ void SearchServer::OnReadable(Connection& c) {
       }
       return;
     }
-    c.last_activity = Clock::now();
+    c.last_activity = Now();
     const size_t got = static_cast<size_t>(n);
     if (c.discard > 0) {
       c.discard -= got;
@@ -257,7 +269,7 @@ void SearchServer::OnWritable(Connection& c) {
       break;
     }
     c.written += static_cast<size_t>(n);
-    c.last_activity = Clock::now();
+    c.last_activity = Now();
   }
   held_bytes_ -= c.out.size();
   c.out = std::string();
@@ -266,8 +278,14 @@ void SearchServer::OnWritable(Connection& c) {
 }
 
 int SearchServer::NextTimeoutMs(int timeout_ms) const {
-  const auto now = Clock::now();
+  const auto now = Now();
   int64_t wait = timeout_ms;
+  if (accept_paused_until_ > now) {
+    wait = std::min<int64_t>(
+        wait,
+        std::chrono::duration_cast<std::chrono::milliseconds>(accept_paused_until_ - now).count() +
+            1);
+  }
   for (const Connection& c : connections_) {
     const auto due = c.last_activity + std::chrono::milliseconds(options_.idle_timeout_ms);
     const int64_t left =
@@ -278,7 +296,7 @@ int SearchServer::NextTimeoutMs(int timeout_ms) const {
 }
 
 void SearchServer::CloseIdle() {
-  const auto now = Clock::now();
+  const auto now = Now();
   for (Connection& c : connections_) {
     if (now - c.last_activity >= std::chrono::milliseconds(options_.idle_timeout_ms)) {
       c.closed = true;
@@ -310,7 +328,8 @@ bool SearchServer::RunOnce(int timeout_ms) {
   std::vector<struct pollfd> fds;
   const bool wake = wake_fd_ >= 0;
   if (wake) fds.push_back({wake_fd_, POLLIN, 0});
-  const bool listening = listen_.valid() && connections_.size() < options_.max_connections;
+  const bool listening = listen_.valid() && connections_.size() < options_.max_connections &&
+                         Now() >= accept_paused_until_;
   if (listening) fds.push_back({listen_.get(), POLLIN, 0});
   const size_t first = fds.size();
   for (const Connection& c : connections_) {

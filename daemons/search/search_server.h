@@ -15,6 +15,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <list>
 #include <string>
 
@@ -33,6 +34,9 @@ struct ServerOptions {
   size_t max_connections = 256;             // more wait in the listen backlog
   size_t memory_bound = size_t{256} << 20;  // bytes held for all connections
   int idle_timeout_ms = 120000;             // a silent connection is closed after this
+  // The clock of the idle timeout and of the accept back-off; steady_clock
+  // when empty (tests step their own).
+  std::function<std::chrono::steady_clock::time_point()> now;
 };
 
 class SearchServer {
@@ -70,6 +74,7 @@ class SearchServer {
   struct Connection;
   using Clock = std::chrono::steady_clock;
 
+  Clock::time_point Now() const { return options_.now ? options_.now() : Clock::now(); }
   void Accept();
   void OnReadable(Connection& c);
   void OnWritable(Connection& c);
@@ -88,6 +93,9 @@ class SearchServer {
   int wake_fd_ = -1;
   bool stopping_ = false;
   bool created_socket_ = false;
+  // Out of descriptors: the listening socket is left alone until then, or
+  // it would wake every round with a connection that cannot be taken.
+  Clock::time_point accept_paused_until_;
   std::list<Connection> connections_;
   size_t held_bytes_ = 0;
 };

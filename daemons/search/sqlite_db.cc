@@ -104,5 +104,11 @@ std::string Statement::Text(int column) const {
   return std::string(text, static_cast<size_t>(sqlite3_column_bytes(stmt_.get(), column)));
 }
 
+std::string_view Statement::TextView(int column) const {
+  const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(stmt_.get(), column));
+  if (text == nullptr) return std::string_view();
+  return std::string_view(text, static_cast<size_t>(sqlite3_column_bytes(stmt_.get(), column)));
+}
+
 }  // namespace search
 }  // namespace orvex

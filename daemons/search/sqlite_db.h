@@ -9,6 +9,7 @@
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <string_view>
 
 namespace orvex {
 namespace search {
@@ -41,6 +42,8 @@ class Statement {
   int64_t Int(int column) const;
   double Double(int column) const;
   std::string Text(int column) const;
+  // Valid until the next Step, Reset or column call on this statement.
+  std::string_view TextView(int column) const;
 
  private:
   struct Finalize {

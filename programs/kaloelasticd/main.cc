@@ -5,6 +5,7 @@
 //   kaloelasticd [--foreground]
 #include <fcntl.h>
 #include <signal.h>
+#include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -13,7 +14,6 @@
 #include <cstring>
 #include <iostream>
 #include <memory>
-#include <stdexcept>
 #include <string>
 
 #include "orvex/portable/atomic_file.h"
@@ -50,27 +50,22 @@ constexpr char kUsage[] =
     "finished; changes not committed are dropped), 1 when it cannot start,\n"
     "2 bad usage.\n";
 
-struct Options {
-  bool help = false;
-  bool version = false;
-  bool foreground = false;
-};
+using Options = orvex::portable::DaemonOptions;
 
 Options ParseArgs(int argc, char** argv) {
   Options opt;
-  for (int i = 1; i < argc; ++i) {
-    const std::string arg = argv[i];
-    if (arg == "--help") {
-      opt.help = true;
-    } else if (arg == "--version") {
-      opt.version = true;
-    } else if (arg == "--foreground") {
-      opt.foreground = true;
-    } else {
-      throw orvex::portable::DaemonUsageError("unknown argument " + arg);
-    }
-  }
+  orvex::portable::DaemonFlagParser(opt).Parse(argc, argv);
   return opt;
+}
+
+// Every open index holds a few descriptors and every client one: a soft
+// limit of 1,024 would be reached long before the hard one.
+void RaiseDescriptorLimit() {
+  struct rlimit limit;
+  if (::getrlimit(RLIMIT_NOFILE, &limit) == 0 && limit.rlim_cur < limit.rlim_max) {
+    limit.rlim_cur = limit.rlim_max;
+    ::setrlimit(RLIMIT_NOFILE, &limit);
+  }
 }
 
 void Complain(const std::string& why) {
@@ -83,6 +78,7 @@ int Serve(const Options& opt) {
   const int started = orvex::portable::DetachUnlessForeground(opt.foreground, ready);
   if (started >= 0) return started;  // the starter, told how the start went
   ::openlog(kIdent, LOG_PID, LOG_DAEMON);
+  RaiseDescriptorLimit();
   orvex::FileDescriptor stop = orvex::portable::BlockStopSignals();
   std::unique_ptr<orvex::search::SearchEngine> engine;
   try {

@@ -229,6 +229,8 @@ TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
       {"shorter than announced", LengthWord(100) + "{\"command\"", true, search::kBadFrame},
       {"half a length word", std::string("\x10\x00", 2), true, search::kBadFrame},
       {"not JSON", Framed("this is not json"), false, search::kBadJson},
+      {"no NUL at the end", LengthWord(2) + "{}", false, search::kBadJson},
+      {"a NUL inside", LengthWord(6) + std::string("{}\0{}\0", 6), false, search::kBadJson},
       {"unknown command", Framed(R"({"command": "explode", "data": {}})"), false,
        search::kUnknownCommand},
       {"id with ..", Framed(R"({"command": "commit", "data": {"id": "fileindex_.."}})"), false,

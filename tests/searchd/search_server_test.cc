@@ -1,6 +1,10 @@
 // The socket loop's bounds, driven round by round with RunOnce().
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
+#include <algorithm>
+#include <chrono>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -78,6 +82,86 @@ TEST_F(SearchServerTest, ConnectionsOverTheCapWaitTheirTurn) {
   ASSERT_TRUE(SendBytes(third.get(), Framed(toString(Command("commit", kId)))));
   first.reset();  // one leaves: the third gets in and is answered
   EXPECT_TRUE(ReadAnswer(third.get())["success"].asBool());
+}
+
+TEST_F(SearchServerTest, SilentAndHalfSentConnectionsAreClosedAfterTheIdleTimeout) {
+  auto now = std::make_shared<std::chrono::steady_clock::time_point>();
+  search::ServerOptions options;
+  options.now = [now] { return *now; };
+  Restart(&options);
+  FileDescriptor silent = ConnectRaw(SocketPath());
+  FileDescriptor half = ConnectRaw(SocketPath());
+  ASSERT_TRUE(SendBytes(half.get(), LengthWord(100) + "{"));
+  for (int i = 0; i < 5 && server_->held_bytes() == 0; ++i) server_->RunOnce(0);
+  EXPECT_EQ(2u, server_->connection_count());
+  *now += std::chrono::milliseconds(options.idle_timeout_ms - 1);
+  server_->RunOnce(0);
+  EXPECT_EQ(2u, server_->connection_count());
+  *now += std::chrono::milliseconds(1);
+  EXPECT_TRUE(ClosedByDaemon(silent.get()));
+  EXPECT_TRUE(ClosedByDaemon(half.get()));
+  EXPECT_EQ(0u, server_->held_bytes());
+}
+
+// Each client connects, sends a search and reads its answer, all at once:
+// more than the connection cap and the listen backlog together.
+TEST_F(SearchServerTest, AThousandClientsAtOnceAreAllAnswered) {
+  constexpr size_t kClients = 1000;
+  struct rlimit fds;
+  ASSERT_EQ(0, ::getrlimit(RLIMIT_NOFILE, &fds));
+  if (fds.rlim_cur < 2 * kClients) {
+    fds.rlim_cur = std::min<rlim_t>(fds.rlim_max, 2 * kClients);
+    ::setrlimit(RLIMIT_NOFILE, &fds);
+  }
+  if (fds.rlim_cur < kClients + 400) GTEST_SKIP() << "needs more descriptors than the hard limit";
+  CreateIndex();
+  Ok(Upsert(kId, FileDoc("/v/s/only.txt")));
+  Ok(Command("commit", kId));
+  const std::string request = Framed(R"({"command": "search", "data": {"name": "only"}})");
+  struct sockaddr_un address = {};
+  address.sun_family = AF_UNIX;
+  std::strncpy(address.sun_path, SocketPath().c_str(), sizeof(address.sun_path) - 1);
+  enum class State { kConnecting, kWaiting, kAnswered };
+  std::vector<State> states(kClients, State::kConnecting);
+  std::vector<FileDescriptor> clients;
+  std::vector<std::string> received(kClients);
+  for (size_t i = 0; i < kClients; ++i) {
+    clients.emplace_back(::socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    ASSERT_TRUE(clients.back().valid());
+  }
+  size_t answered = 0;
+  for (int round = 0; answered < kClients && round < 5000; ++round) {
+    for (size_t i = 0; i < kClients; ++i) {
+      const int fd = clients[i].get();
+      if (states[i] == State::kConnecting) {
+        // A full backlog answers EAGAIN: the client tries again next round.
+        if (::connect(fd, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) != 0) {
+          ASSERT_EQ(EAGAIN, errno);
+          continue;
+        }
+        ASSERT_TRUE(SendBytes(fd, request));
+        states[i] = State::kWaiting;
+      } else if (states[i] == State::kWaiting) {
+        char chunk[4096];
+        const ssize_t n = ::recv(fd, chunk, sizeof(chunk), MSG_DONTWAIT);
+        if (n > 0) received[i].append(chunk, static_cast<size_t>(n));
+        uint32_t length = 0;
+        if (received[i].size() < 4) continue;
+        std::memcpy(&length, received[i].data(), 4);
+        if (received[i].size() < 4 + length) continue;
+        const Json::Value answer = ParseJson(received[i].substr(4, length - 1));
+        EXPECT_EQ(1, answer["data"]["total"].asInt()) << i << ": " << toString(answer);
+        clients[i].reset();
+        states[i] = State::kAnswered;
+        ++answered;
+      }
+    }
+    server_->RunOnce(/*timeout_ms=*/0);
+  }
+  EXPECT_EQ(kClients, answered);
+  for (int i = 0; i < 10 && server_->connection_count() > 0; ++i) server_->RunOnce(10);
+  EXPECT_EQ(0u, server_->connection_count());
+  EXPECT_EQ(0u, server_->held_bytes());
 }
 
 TEST_F(SearchServerTest, RequestStopFinishesAnswersAndDropsPartialRequests) {
