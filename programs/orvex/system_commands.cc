@@ -89,12 +89,24 @@ std::string ProgramDir() {
   return orvex::Dirname(path);
 }
 
+// True while pid runs. A daemon that has exited stays a zombie until its
+// parent (init, for a detached daemon) reaps it, which some inits do only
+// every few seconds: a zombie counts as gone.
+bool Running(pid_t pid) {
+  if (::kill(pid, 0) != 0) return false;
+  std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
+  std::string text;
+  if (!std::getline(stat, text)) return true;
+  const size_t name_end = text.rfind(')');  // the name may hold spaces and ')'
+  return name_end == std::string::npos || name_end + 2 >= text.size() || text[name_end + 2] != 'Z';
+}
+
 // The daemon's pid when its pid file names a live process of that program;
 // 0 otherwise (no file, a stale file, a reused pid).
 pid_t RunningPid(const Daemon& daemon) {
   std::ifstream pid_file(orvex::portable::RootPath(daemon.pid_path));
   long pid = 0;
-  if (!(pid_file >> pid) || pid <= 0 || ::kill(static_cast<pid_t>(pid), 0) != 0) return 0;
+  if (!(pid_file >> pid) || pid <= 0 || !Running(static_cast<pid_t>(pid))) return 0;
   std::ifstream comm("/proc/" + std::to_string(pid) + "/comm");
   std::string name;
   std::getline(comm, name);
@@ -146,7 +158,7 @@ int Up(const Args& args) {
 
 bool WaitGone(pid_t pid) {
   const auto give_up = std::chrono::steady_clock::now() + kStopWait;
-  while (::kill(pid, 0) == 0) {
+  while (Running(pid)) {
     if (std::chrono::steady_clock::now() >= give_up) return false;
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
   }
