@@ -28,6 +28,7 @@ IndexDaemon::IndexDaemon(IndexDaemonOptions options)
     : options_(std::move(options)), server_(options_.server) {}
 
 bool IndexDaemon::Start(std::string& why) {
+  fileindex::log_level = options_.log_level;
   if (!server_.Listen(why)) return false;
   try {
     resume_time_ = fileindex::StatusMgr().GetPauseInfo();
@@ -106,6 +107,9 @@ Json::Value IndexDaemon::Dispatch(const std::string& type, const Json::Value& da
     resume_time_ = data["resume_time"].asInt64();
   } else if (type == "resume") {
     resume_time_ = fileindex::kResumeTimeRunning;
+    // Told to go on: whatever stopped a batch (the search daemon away, a
+    // full volume) may be over, so nobody waits out a retry.
+    for (const auto& [share, worker] : workers_) worker->RetryNow();
   } else if (type == "worker_create") {
     CreateWorker(ShareOf(data));
   } else if (type == "worker_delete") {

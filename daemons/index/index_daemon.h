@@ -8,6 +8,7 @@
 #define ORVEX_DAEMONS_INDEX_INDEX_DAEMON_H_
 
 #include <json/json.h>
+#include <syslog.h>
 
 #include <cstdint>
 #include <map>
@@ -23,6 +24,10 @@ namespace indexd {
 struct IndexDaemonOptions {
   CommandServerOptions server;
   WorkerOptions worker;
+  // The library's trace level while the daemon runs (a syslog priority).
+  // At LOG_DEBUG every queue line is written to the log, which costs more
+  // than indexing it under a storm; below it only failures are.
+  int log_level = LOG_INFO;
 };
 
 class IndexDaemon {
@@ -31,8 +36,9 @@ class IndexDaemon {
   IndexDaemon(const IndexDaemon&) = delete;
   IndexDaemon& operator=(const IndexDaemon&) = delete;
 
-  // Opens the command socket, reads the pause state and starts a worker for
-  // every indexed share with a folder that is not paused. Returns false with
+  // Sets the library's trace level, opens the command socket, reads the
+  // pause state and starts a worker for every indexed share with a folder
+  // that is not paused. Returns false with
   // why when the socket cannot be made; unreadable state files are logged
   // and read as "running, no shares".
   bool Start(std::string& why);

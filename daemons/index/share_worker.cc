@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <exception>
 #include <utility>
 #include <vector>
@@ -25,6 +26,9 @@ namespace el = fileindex::elastic;
 using fileindex::OP;
 
 namespace {
+
+// The search daemon's answer to a change of a document it does not hold.
+constexpr int kNoSuchDocument = 1107;
 
 bool IsMetadataName(const std::string& name) {
   return name == "@eaDir" || name == "#recycle" || name == "#snapshot";
@@ -106,6 +110,14 @@ size_t ShareWorker::Step() {
     if (actions_.empty()) FinishBatch();
     last_error_.clear();
   } catch (const std::exception& e) {
+    actions_.insert(actions_.begin(), uncommitted_.begin(), uncommitted_.end());
+    uncommitted_.clear();
+    const auto* error = dynamic_cast<const Error*>(&e);
+    if (error != nullptr && error->code() == kErrorNoSpace && !full_walk_) {
+      // The share is flagged for a re-index: the batch that commits once
+      // there is room again includes it, and clears the flag.
+      ScheduleFullWalk();
+    }
     last_error_ = e.what();
     retry_at_ = now + options_.retry_s;
     LogPlain("fileindexd: share %s: batch stopped, retry in %lds: %s", share_.c_str(),
@@ -114,21 +126,28 @@ size_t ShareWorker::Step() {
   return sent;
 }
 
+int64_t ShareWorker::NowMs() const {
+  if (options_.clock_ms) return options_.clock_ms();
+  return std::chrono::duration_cast<std::chrono::milliseconds>(
+             std::chrono::steady_clock::now().time_since_epoch())
+      .count();
+}
+
 bool ShareWorker::SnapshotDue() {
   if (IsFileExist(queue_path_ + ".tmp")) return true;  // left by a run that did not finish
   struct stat st;
   if (::stat(queue_path_.c_str(), &st) != 0 || st.st_size == 0) {
     seen_size_ = 0;
-    first_seen_ = 0;
+    first_seen_.reset();
     return false;
   }
-  const time_t now = Now();
+  const int64_t now = NowMs();
   if (st.st_size != seen_size_) {
     seen_size_ = st.st_size;
     seen_change_ = now;
-    if (first_seen_ == 0) first_seen_ = now;
+    if (!first_seen_) first_seen_ = now;
   }
-  return now - seen_change_ >= options_.quiet_s || now - first_seen_ >= options_.max_wait_s;
+  return now - seen_change_ >= options_.quiet_ms || now - *first_seen_ >= options_.max_wait_ms;
 }
 
 void ShareWorker::TakeSnapshot() {
@@ -136,12 +155,16 @@ void ShareWorker::TakeSnapshot() {
   folders_ = std::make_unique<fileindex::FolderMgr>();
   fileindex::QueueMgr queue(queue_path_);
   queue.ProcessOP([this](std::shared_ptr<OP> op) { AddOp(op); }, /*use_tmp=*/true);
+  // Directories change with their entries, which report no event of their
+  // own: refreshed last, once each, as they are when the batch ends.
+  for (const std::string& path : refresh_) actions_.push_back({Kind::kRefresh, path, ""});
+  refresh_.clear();
   in_batch_ = true;
   from_snapshot_ = true;
   batch_start_ = Now();
   done_ = 0;
   seen_size_ = 0;
-  first_seen_ = 0;
+  first_seen_.reset();
 }
 
 void ShareWorker::AddOp(const std::shared_ptr<OP>& op) {
@@ -149,15 +172,22 @@ void ShareWorker::AddOp(const std::shared_ptr<OP>& op) {
   switch (op->kind) {
     case fileindex::OP_DELETE:
       actions_.push_back({Kind::kDelete, path, ""});
+      TouchParent(path);
       break;
     case fileindex::OP_UPSERT:
       actions_.push_back({Kind::kUpsert, path, ""});
+      TouchParent(path);
       break;
     case fileindex::OP_ATTR:
       actions_.push_back({Kind::kAttr, path, ""});
       break;
     case fileindex::OP_RENAME:
       actions_.push_back({Kind::kRename, path, op->path});
+      rename_targets_.insert(path);
+      // A moved item's own change time moves with it.
+      refresh_.insert(path);
+      TouchParent(path);
+      TouchParent(op->path);
       break;
     // A configuration change may switch metadata on or off for some file
     // types or remove the folder: the subtree is indexed again as it now
@@ -167,6 +197,7 @@ void ShareWorker::AddOp(const std::shared_ptr<OP>& op) {
       break;
     case fileindex::OP_REINDEX:
       actions_.push_back({Kind::kReindex, path, "", false});
+      TouchParent(path);
       break;
     case fileindex::OP_QUEUE_CRASHED:
       actions_.push_back({Kind::kReindex, share_root_, "", false});
@@ -180,6 +211,8 @@ size_t ShareWorker::Perform(const Action& action) {
   switch (action.kind) {
     case Kind::kDelete:
       return Remove(action.path, /*with_descendants=*/false);
+    case Kind::kDeleteTree:
+      return Remove(action.path, /*with_descendants=*/true);
     case Kind::kUpsert:
       return Upsert(action.path, /*attr_only=*/false);
     case Kind::kAttr:
@@ -193,8 +226,15 @@ size_t ShareWorker::Perform(const Action& action) {
       return 0;
     case Kind::kSweep:
       return Sweep(action.path);
+    case Kind::kRefresh:
+      return Refresh(action.path);
   }
   return 0;
+}
+
+void ShareWorker::TouchParent(const std::string& path) {
+  const size_t slash = path.rfind('/');
+  if (slash != std::string::npos && slash > 0) refresh_.insert(path.substr(0, slash));
 }
 
 // What is gone is removed and what remains is indexed again. Files whose
@@ -205,10 +245,16 @@ size_t ShareWorker::Reindex(const std::string& path, bool refresh) {
   bool is_dir = false;
   if (IsDocument(path) && Exists(path, is_dir)) {
     if (is_dir) LearnKnown(path);
-    const size_t sent = Upsert(path, /*attr_only=*/false);
+    size_t sent = Upsert(path, /*attr_only=*/false);
     if (is_dir) {
       actions_.push_front({Kind::kSweep, path, "", false});
       actions_.push_front({Kind::kWalk, path, "", refresh});
+    } else {
+      // Once a directory (now a file or a link in its place): what the index
+      // still holds below it goes.
+      el::IndexDelDir(share_, path);
+      Uncommitted(Kind::kReindex, path);
+      ++sent;
     }
     return sent;
   }
@@ -233,7 +279,7 @@ void ShareWorker::Walk(const std::string& dir, bool refresh) {
     if (IsMetadataName(name)) continue;
     const std::string path = dir + "/" + name;
     bool is_dir = false;
-    if (!Exists(path, is_dir)) continue;
+    if (!Exists(path, is_dir) || rename_targets_.count(path)) continue;
     const bool unchanged = Unchanged(path);
     if (refresh || !unchanged) found.push_back({Kind::kUpsert, path, "", false});
     // Links are documents of their own and never followed.
@@ -282,6 +328,7 @@ size_t ShareWorker::Sweep(const std::string& dir) {
   while (it != known_.end() && StringStartWith(it->first, prefix)) {
     if (!it->second.seen) {
       el::IndexDel(share_, it->first);
+      Uncommitted(Kind::kDelete, it->first);
       ++sent;
     }
     // Forgotten only once deleted: a failed delete is tried again.
@@ -291,10 +338,22 @@ size_t ShareWorker::Sweep(const std::string& dir) {
 }
 
 size_t ShareWorker::Rename(const std::string& from, const std::string& to) {
+  const auto pending = rename_targets_.find(to);
+  if (pending != rename_targets_.end()) rename_targets_.erase(pending);
   const bool from_doc = IsDocument(from);
   const bool to_doc = IsDocument(to);
   if (from_doc && to_doc) {
-    el::IndexRename(share_, from, to);
+    try {
+      el::IndexRename(share_, from, to);
+      Uncommitted(Kind::kRename, to, from);
+    } catch (const Error& e) {
+      if (e.code() != kNoSuchDocument) throw;
+      // The source never reached the index (made and renamed within moments,
+      // like a lock file): the target is indexed as it is, and anything still
+      // recorded below the source goes.
+      actions_.push_front({Kind::kReindex, to, ""});
+      return Remove(from, /*with_descendants=*/true);
+    }
     return 1;
   }
   if (from_doc) return Remove(from, /*with_descendants=*/true);  // moved out of the index
@@ -305,9 +364,17 @@ size_t ShareWorker::Rename(const std::string& from, const std::string& to) {
   // A renamed share root: the indexed folders below it move with it.
   if (!FoldersBelow(to).empty()) {
     el::IndexRename(share_, from, to);
+    Uncommitted(Kind::kRename, to, from);
     return 1;
   }
   return 0;
+}
+
+size_t ShareWorker::Refresh(const std::string& path) {
+  bool is_dir = false;
+  if (!IsDocument(path) || !Exists(path, is_dir)) return 0;  // a delete of its own follows
+  // A directory's document has no content to read.
+  return Upsert(path, /*attr_only=*/!is_dir);
 }
 
 size_t ShareWorker::Upsert(const std::string& path, bool attr_only) {
@@ -315,22 +382,35 @@ size_t ShareWorker::Upsert(const std::string& path, bool attr_only) {
   bool is_dir = false;
   if (!Exists(path, is_dir)) {
     el::IndexDel(share_, path);  // gone before its turn came
+    Uncommitted(Kind::kDelete, path);
     return 1;
   }
   if (attr_only) {
-    el::IndexAttr(share_, path);
-  } else {
-    el::IndexUpsert(share_, path, folders_->IsFullPathNeedMeta(path));
+    try {
+      el::IndexAttr(share_, path);
+      Uncommitted(Kind::kAttr, path);
+      return 1;
+    } catch (const Error& e) {
+      // Never indexed (its upsert was skipped): the whole document it is.
+      if (e.code() != kNoSuchDocument) throw;
+    }
   }
+  el::IndexUpsert(share_, path, folders_->IsFullPathNeedMeta(path));
+  Uncommitted(Kind::kUpsert, path);
+  if (!is_dir) ++total_read_;
   return 1;
 }
 
 size_t ShareWorker::Remove(const std::string& path, bool with_descendants) {
   if (InMetadataFolder(path)) return 0;  // never a document
   el::IndexDel(share_, path);
-  if (!with_descendants) return 1;
-  el::IndexDelDir(share_, path);
-  return 2;
+  if (with_descendants) el::IndexDelDir(share_, path);
+  Uncommitted(with_descendants ? Kind::kDeleteTree : Kind::kDelete, path);
+  return with_descendants ? 2 : 1;
+}
+
+void ShareWorker::Uncommitted(Kind kind, const std::string& path, const std::string& from) {
+  uncommitted_.push_back({kind, path, from});
 }
 
 void ShareWorker::CountSent(size_t sent) {
@@ -340,6 +420,7 @@ void ShareWorker::CountSent(size_t sent) {
   if (since_commit_ >= options_.commit_every) {
     el::IndexCommit(share_);
     since_commit_ = 0;
+    uncommitted_.clear();
   }
 }
 
@@ -348,6 +429,7 @@ void ShareWorker::FinishBatch() {
     el::IndexCommit(share_);
     since_commit_ = 0;
   }
+  uncommitted_.clear();
   // Only now, with everything committed, may the snapshot go: a run killed
   // before this point finds it again and starts the batch over.
   if (from_snapshot_) fileindex::QueueMgr(queue_path_).DeleteTmp();
@@ -357,6 +439,7 @@ void ShareWorker::FinishBatch() {
   }
   in_batch_ = false;
   from_snapshot_ = false;
+  rename_targets_.clear();
   folders_.reset();
 }
 
@@ -414,6 +497,7 @@ Json::Value ShareWorker::Status() const {
   out["eta"] = rate > 0 ? static_cast<Json::Int64>(static_cast<double>(actions_.size()) / rate)
                         : static_cast<Json::Int64>(-1);
   out["total_done"] = static_cast<Json::Int64>(total_done_);
+  out["total_read"] = static_cast<Json::Int64>(total_read_);
   out["last_error"] = last_error_;
   return out;
 }

@@ -7,17 +7,25 @@
 // directory governed by an indexed folder is a document of its own; nothing
 // inside the metadata folders (@eaDir, #recycle, #snapshot) ever is. The
 // index is committed every few thousand documents and at the end of the
-// batch, and only then is the snapshot deleted. One thread at a time.
+// batch, and only then is the snapshot deleted; a batch that stops sends what
+// it had not committed again, since the search daemon may have lost it.
+// Directories, whose times change with their entries, are refreshed at the
+// end of the batch. One thread at a time.
 #ifndef ORVEX_DAEMONS_INDEX_SHARE_WORKER_H_
 #define ORVEX_DAEMONS_INDEX_SHARE_WORKER_H_
 
 #include <json/json.h>
 
+#include <cstdint>
 #include <ctime>
 #include <deque>
+#include <functional>
 #include <map>
 #include <memory>
+#include <optional>
+#include <set>
 #include <string>
+#include <vector>
 
 #include "orvex/config/folder_mgr.h"
 #include "orvex/queue/op.h"
@@ -26,17 +34,22 @@ namespace orvex {
 namespace indexd {
 
 struct WorkerOptions {
-  // Seconds the live queue must stay unchanged before it is taken.
-  time_t quiet_s = 2;
+  // Milliseconds the live queue must stay unchanged before it is taken:
+  // long enough that a burst (an untar, a checkout) becomes one batch,
+  // short enough that a single save is searchable within a second.
+  int64_t quiet_ms = 250;
   // A queue that never stops growing is taken this long after its first
   // line was seen, so a steady stream is still indexed.
-  time_t max_wait_s = 30;
+  int64_t max_wait_ms = 30000;
   // Documents sent between two commits of the share's index.
   size_t commit_every = 2000;
   // Document commands per Step, so that the loop returns regularly.
   size_t step_budget = 200;
   // Seconds before a batch that failed (search daemon away) is tried again.
   time_t retry_s = 30;
+  // The monotonic clock, in milliseconds, that times the quiet period;
+  // empty: the system's steady clock.
+  std::function<int64_t()> clock_ms;
 };
 
 class ShareWorker {
@@ -61,13 +74,28 @@ class ShareWorker {
   // Work waits in memory (a batch being carried out, not waiting to retry).
   bool HasWork() const;
 
-  // {"state", "done", "todo", "rate", "eta", "total_done", "last_error"}.
+  // A batch waiting to be retried (the search daemon was away) is tried at
+  // the next step.
+  void RetryNow() { retry_at_ = 0; }
+
+  // {"state", "done", "todo", "rate", "eta", "total_done", "total_read",
+  // "last_error"}.
   Json::Value Status() const;
 
   const std::string& share() const { return share_; }
 
  private:
-  enum class Kind { kDelete, kUpsert, kAttr, kRename, kReindex, kWalk, kSweep };
+  enum class Kind {
+    kDelete,
+    kDeleteTree,
+    kUpsert,
+    kAttr,
+    kRename,
+    kReindex,
+    kWalk,
+    kSweep,
+    kRefresh
+  };
   struct Action {
     Kind kind;
     std::string path;
@@ -82,6 +110,7 @@ class ShareWorker {
     bool seen = false;
   };
 
+  int64_t NowMs() const;
   bool SnapshotDue();
   void TakeSnapshot();
   void AddOp(const std::shared_ptr<fileindex::OP>& op);
@@ -97,10 +126,20 @@ class ShareWorker {
   // Deletes the documents below dir that the walk did not find.
   size_t Sweep(const std::string& dir);
   size_t Rename(const std::string& from, const std::string& to);
+  // Queues a refresh of the document of path's directory (its times change
+  // with its entries), once per batch.
+  void TouchParent(const std::string& path);
+  // Brings the attributes of path's document up to date without reading
+  // the file's content.
+  size_t Refresh(const std::string& path);
   size_t Upsert(const std::string& path, bool attr_only);
   size_t Remove(const std::string& path, bool with_descendants);
   void FinishBatch();
   void CountSent(size_t sent);
+  // Notes a document command sent since the last commit, to be sent again
+  // when the batch stops: the search daemon may lose what it had not
+  // committed (killed, or out of space).
+  void Uncommitted(Kind kind, const std::string& path, const std::string& from = "");
 
   // A document of the index: governed by an indexed folder and outside the
   // metadata folders.
@@ -115,7 +154,12 @@ class ShareWorker {
   WorkerOptions options_;
 
   std::deque<Action> actions_;
-  std::map<std::string, Known> known_;             // by path, while a walk is under way
+  std::map<std::string, Known> known_;  // by path, while a walk is under way
+  // Targets of the batch's renames not carried out yet: a walk leaves them
+  // to their rename, which moves their documents instead of reading them.
+  std::multiset<std::string> rename_targets_;
+  std::set<std::string> refresh_;  // directories (and moved items) to refresh
+  std::vector<Action> uncommitted_;
   std::unique_ptr<fileindex::FolderMgr> folders_;  // loaded per batch
   bool in_batch_ = false;
   bool from_snapshot_ = false;
@@ -124,6 +168,7 @@ class ShareWorker {
   size_t since_commit_ = 0;
   size_t done_ = 0;
   size_t total_done_ = 0;
+  size_t total_read_ = 0;  // documents made from the file's content (upserts)
   time_t batch_start_ = 0;
   time_t retry_at_ = 0;
   std::string last_error_;
@@ -131,8 +176,8 @@ class ShareWorker {
   // The live queue as last seen: its size, when that last changed, and
   // when it was first seen holding lines.
   long long seen_size_ = 0;
-  time_t seen_change_ = 0;
-  time_t first_seen_ = 0;
+  int64_t seen_change_ = 0;
+  std::optional<int64_t> first_seen_;
 };
 
 }  // namespace indexd

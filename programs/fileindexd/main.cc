@@ -11,7 +11,6 @@
 #include <cerrno>
 #include <cstring>
 #include <iostream>
-#include <stdexcept>
 #include <string>
 
 #include "index/index_daemon.h"
@@ -25,7 +24,9 @@ namespace {
 
 constexpr char kIdent[] = "fileindexd";
 constexpr int kExitFailure = 1;
-constexpr int kStepMs = 1000;
+// The idle poll doubles as the watch on the share queues: a change waits at
+// most this long to be noticed, at the cost of one stat per share.
+constexpr int kStepMs = 100;
 constexpr char kPidPath[] = "/var/run/fileindexd.pid";
 
 constexpr char kUsage[] =
@@ -43,28 +44,11 @@ constexpr char kUsage[] =
     "fileindexd already answers on the socket, or the socket cannot be made),\n"
     "2 on bad usage.\n";
 
-using UsageError = orvex::portable::DaemonUsageError;
-
-struct Options {
-  bool help = false;
-  bool version = false;
-  bool foreground = false;
-};
+using Options = orvex::portable::DaemonOptions;
 
 Options ParseArgs(int argc, char** argv) {
   Options opt;
-  for (int i = 1; i < argc; ++i) {
-    const std::string arg = argv[i];
-    if (arg == "--help") {
-      opt.help = true;
-    } else if (arg == "--version") {
-      opt.version = true;
-    } else if (arg == "--foreground") {
-      opt.foreground = true;
-    } else {
-      throw UsageError("unknown argument " + arg);
-    }
-  }
+  orvex::portable::DaemonFlagParser(opt).Parse(argc, argv);
   return opt;
 }
 

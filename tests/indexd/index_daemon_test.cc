@@ -11,6 +11,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <cstring>
@@ -105,7 +107,7 @@ class IndexDaemonTest : public testing::ShareTestRoot {
 
   static WorkerOptions Quick() {
     WorkerOptions worker;
-    worker.quiet_s = 0;
+    worker.quiet_ms = 0;
     return worker;
   }
 
@@ -208,10 +210,13 @@ TEST_F(IndexDaemonTest, QueueBecomesDocumentCommandsInOrderThenCommitAndSnapshot
   Start();
   Drain();
   EXPECT_EQ(Commands(),
-            (std::vector<std::string>{"document_upsert_by_id " + a, "document_upsert_by_id " + b,
-                                      "document_upsert_by_id " + c, "document_set_by_id " + d,
-                                      "document_get_by_query " + d + "/", "compound 0",
-                                      "document_del_by_id " + f, "commit"}));
+            (std::vector<std::string>{
+                "document_upsert_by_id " + a, "document_upsert_by_id " + b,
+                "document_upsert_by_id " + c, "document_set_by_id " + d,
+                "document_get_by_query " + d + "/", "compound 0", "document_del_by_id " + f,
+                // The directory, whose times change with its entries,
+                // and the moved file's change time.
+                "document_upsert_by_id " + docs_, "document_set_by_id " + e, "commit"}));
   EXPECT_EQ(peer_.requests()[0]["data"]["id"], "fileindex_s");
   EXPECT_TRUE(peer_.faults().empty());
 }
@@ -222,8 +227,10 @@ TEST_F(IndexDaemonTest, SnapshotOfAKilledRunIsProcessedBeforeTheLiveQueue) {
   Append(queue_, Line(64, b));
   Start();
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit",
-                                                  "document_upsert_by_id " + b, "commit"}));
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{
+                "document_upsert_by_id " + a, "document_upsert_by_id " + docs_, "commit",
+                "document_upsert_by_id " + b, "document_upsert_by_id " + docs_, "commit"}));
 }
 
 TEST_F(IndexDaemonTest, ReindexWalksTheFolderAndUpsertsEveryFileAndDirectoryButNoMetadata) {
@@ -300,8 +307,9 @@ TEST_F(IndexDaemonTest, ConfigurationChangeReadsEveryFileAgain) {
 
 TEST_F(IndexDaemonTest, QueueIsTakenWhenQuietOrAfterTheLongestWaitOfASteadyStream) {
   WorkerOptions worker;
-  worker.quiet_s = 5;
-  worker.max_wait_s = 30;
+  worker.quiet_ms = 5000;
+  worker.max_wait_ms = 30000;
+  worker.clock_ms = [this] { return int64_t{now_} * 1000; };
   Start(worker);
   const std::string a = Touch("a.bin");
   Append(queue_, Line(2, a));
@@ -311,18 +319,19 @@ TEST_F(IndexDaemonTest, QueueIsTakenWhenQuietOrAfterTheLongestWaitOfASteadyStrea
   EXPECT_TRUE(peer_.requests().empty());  // not yet quiet for long enough
   now_ += 1;
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
+                                                  "document_upsert_by_id " + docs_, "commit"}));
 
   // A line every few seconds: never quiet, yet taken once the first has waited 30 s.
   for (int second = 0; second < 30; second += 3) {
     Append(queue_, Line(2, a));
     daemon_->RunOnce(0);
-    EXPECT_EQ(peer_.requests().size(), 2u) << "taken early, at second " << second;
+    EXPECT_EQ(peer_.requests().size(), 3u) << "taken early, at second " << second;
     now_ += 3;
   }
   Append(queue_, Line(2, a));
   Drain();
-  EXPECT_EQ(peer_.requests().size(), 4u);
+  EXPECT_EQ(peer_.requests().size(), 6u);
 }
 
 TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
@@ -334,13 +343,44 @@ TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
   for (int i = 0; i < 20; ++i) daemon_->RunOnce(0);
   EXPECT_TRUE(Exists(queue_ + ".tmp"));
   EXPECT_EQ(daemon_->Status()["shares"]["s"]["state"], "retrying");
-  EXPECT_EQ(daemon_->Status()["shares"]["s"]["todo"], 2);
+  EXPECT_EQ(daemon_->Status()["shares"]["s"]["todo"], 3);  // a, b, their directory
   FramedPeer back(dir_.Join("var/run/kaloelasticd.sock"));
   now_ += 30;
   Drain();
-  EXPECT_EQ(back.requests().size(), 3u);
+  EXPECT_EQ(back.requests().size(), 4u);
   EXPECT_EQ(back.requests()[0]["data"]["doc_id"], a);
-  EXPECT_EQ(back.requests()[2]["command"], "commit");
+  EXPECT_EQ(back.requests()[3]["command"], "commit");
+}
+
+TEST_F(IndexDaemonTest, WhatAFailedCommitMayHaveLostIsSentAgainAndANeverIndexedSourceIsSkipped) {
+  const std::string a = Touch("a.bin"), b = Touch("b.bin");
+  const std::string lock = docs_ + "/b.lock";  // made and renamed before it was indexed
+  Append(queue_, Line(64, a));
+  Append(queue_, RenameLine(lock, b));
+  std::atomic<bool> refused{false};
+  peer_.SetResponder([&](const Json::Value& request) -> FramedPeer::Reply {
+    if (request["command"] == "document_set_by_id" && request["data"]["doc_id"] == lock) {
+      return R"({"success": false, "error": {"code": 1107, "msg": "no document"}})";
+    }
+    if (request["command"] == "commit" && !refused.exchange(true)) {
+      return R"({"success": false, "error": {"code": 1500, "msg": "disk I/O error"}})";
+    }
+    return std::string(FramedPeer::kSuccess);
+  });
+  Start();
+  daemon_->RunOnce(0);  // the whole batch, up to its refused commit
+  const std::vector<std::string> first = Commands();
+  ASSERT_EQ(first.back(), "commit");
+  EXPECT_NE(std::count(first.begin(), first.end(), "document_upsert_by_id " + b), 0);
+  EXPECT_NE(std::count(first.begin(), first.end(), "document_del_by_query " + lock + "/"), 0);
+  now_ += 30;
+  Drain();
+  const std::vector<std::string> all = Commands();
+  const std::vector<std::string> again(all.begin() + static_cast<long>(first.size()), all.end());
+  for (const std::string& command : first) {
+    if (command == "document_set_by_id " + lock) continue;  // refused: its fallback stands in
+    EXPECT_NE(std::count(again.begin(), again.end(), command), 0) << command << " not sent again";
+  }
 }
 
 TEST_F(IndexDaemonTest, CrashMarkWalksEveryIndexedFolderOfTheShareInstead) {
@@ -363,7 +403,8 @@ TEST_F(IndexDaemonTest, EventsInMetadataFoldersNeverBecomeDocuments) {
   Append(queue_, Line(64, kept));
   Start();
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + kept, "commit"}));
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + kept,
+                                                  "document_upsert_by_id " + docs_, "commit"}));
 }
 
 TEST_F(IndexDaemonTest, NothingIsSentWhilePausedUntilTheResumeTimeComes) {
@@ -377,7 +418,8 @@ TEST_F(IndexDaemonTest, NothingIsSentWhilePausedUntilTheResumeTimeComes) {
   EXPECT_EQ(daemon_->Status()["paused"], true);
   now_ = kStart + 3600;
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
+                                                  "document_upsert_by_id " + docs_, "commit"}));
   EXPECT_EQ(daemon_->Status()["paused"], false);
 }
 
@@ -392,7 +434,8 @@ TEST_F(IndexDaemonTest, PauseAndResumeCommandsHoldAndReleaseTheWorkers) {
   EXPECT_TRUE(peer_.requests().empty());
   Command("resume", Json::nullValue);
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
+                                                  "document_upsert_by_id " + docs_, "commit"}));
 }
 
 TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
@@ -406,13 +449,14 @@ TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
   const std::string a = Touch("a.bin");
   Append(queue_, Line(64, a));
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a, "commit"}));
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
+                                                  "document_upsert_by_id " + docs_, "commit"}));
 
   Command("worker_delete", share);
   EXPECT_FALSE(daemon_->HasWorker("s"));
   Append(queue_, Line(64, a));
   for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
-  EXPECT_EQ(peer_.requests().size(), 2u);
+  EXPECT_EQ(peer_.requests().size(), 3u);
   EXPECT_TRUE(Exists(queue_));
 }
 

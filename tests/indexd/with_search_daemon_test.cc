@@ -47,7 +47,7 @@ class WithSearchDaemonTest : public testing::ShareTestRoot {
 
     IndexDaemonOptions options;
     options.server.socket_path = dir_.Join("var/run/fileindexd.sock");
-    options.worker.quiet_s = 0;
+    options.worker.quiet_ms = 0;
     daemon_ = std::make_unique<IndexDaemon>(options);
     std::string why;
     ASSERT_TRUE(daemon_->Start(why)) << why;
