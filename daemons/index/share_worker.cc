@@ -11,6 +11,8 @@
 #include <vector>
 
 #include "elastic/channel.h"
+#include "index/index_pages.h"
+#include "index/ordered_tree_walk.h"
 #include "orvex/elastic.h"
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/log.h"
@@ -41,22 +43,13 @@ bool Exists(const std::string& path, bool& is_dir) {
   return true;
 }
 
-// The entries of dir by name; empty when it cannot be read (it may have
-// gone since it was queued: its own delete event follows).
-std::vector<std::string> ListDir(const std::string& dir) {
-  std::vector<std::string> names;
-  DIR* d = ::opendir(dir.c_str());
-  if (d == nullptr) return names;
-  while (const dirent* entry = ::readdir(d)) {
-    const std::string name = entry->d_name;
-    if (name != "." && name != "..") names.push_back(name);
-  }
-  ::closedir(d);
-  std::sort(names.begin(), names.end());
-  return names;
-}
-
 }  // namespace
+
+struct ShareWorker::SubtreeWalk {
+  OrderedTreeWalk disk;
+  IndexPages index;
+  bool refresh;
+};
 
 ShareWorker::ShareWorker(std::string share, std::string share_root, std::string queue_path,
                          WorkerOptions options)
@@ -88,12 +81,14 @@ size_t ShareWorker::Step() {
       TakeSnapshot();
     }
     if (!folders_) folders_ = std::make_unique<fileindex::FolderMgr>();
-    while (sent < options_.step_budget && !actions_.empty()) {
+    size_t work = 0;
+    while (work < options_.step_budget && !actions_.empty()) {
       const Action action = actions_.front();
       actions_.pop_front();
       size_t n = 0;
+      const size_t work_before = work;
       try {
-        n = Perform(action);
+        n = Perform(action, work);
       } catch (const Error& e) {
         if (e.code() != kErrorParseDocument) {
           actions_.push_front(action);
@@ -104,6 +99,7 @@ size_t ShareWorker::Step() {
         LogPlain("fileindexd: share %s: skipped %s: %s", share_.c_str(), action.path.c_str(),
                  e.what());
       }
+      if (work == work_before) work += std::max<size_t>(n, 1);
       sent += n;
       CountSent(n);
     }
@@ -207,7 +203,7 @@ void ShareWorker::AddOp(const std::shared_ptr<OP>& op) {
   }
 }
 
-size_t ShareWorker::Perform(const Action& action) {
+size_t ShareWorker::Perform(const Action& action, size_t& work) {
   switch (action.kind) {
     case Kind::kDelete:
       return Remove(action.path, /*with_descendants=*/false);
@@ -222,10 +218,7 @@ size_t ShareWorker::Perform(const Action& action) {
     case Kind::kReindex:
       return Reindex(action.path, action.refresh);
     case Kind::kWalk:
-      Walk(action.path, action.refresh);
-      return 0;
-    case Kind::kSweep:
-      return Sweep(action.path);
+      return WalkSome(action, work);
     case Kind::kRefresh:
       return Refresh(action.path);
   }
@@ -239,102 +232,86 @@ void ShareWorker::TouchParent(const std::string& path) {
 
 // What is gone is removed and what remains is indexed again. Files whose
 // size and change times match their document are not read again unless the
-// folder's settings changed (refresh); documents the walk does not find are
-// deleted at its end, so nothing vanishes from searches meanwhile.
+// folder's settings changed (refresh).
 size_t ShareWorker::Reindex(const std::string& path, bool refresh) {
   bool is_dir = false;
-  if (IsDocument(path) && Exists(path, is_dir)) {
-    if (is_dir) LearnKnown(path);
-    size_t sent = Upsert(path, /*attr_only=*/false);
-    if (is_dir) {
-      actions_.push_front({Kind::kSweep, path, "", false});
-      actions_.push_front({Kind::kWalk, path, "", refresh});
-    } else {
+  const bool exists = Exists(path, is_dir);
+  if (IsDocument(path) && exists) {
+    if (!is_dir) {
+      const size_t sent = Upsert(path, /*attr_only=*/false);
       // Once a directory (now a file or a link in its place): what the index
       // still holds below it goes.
       el::IndexDelDir(share_, path);
       Uncommitted(Kind::kReindex, path);
-      ++sent;
+      return sent + 1;
     }
+    auto walk = StartWalk(path, refresh);
+    const size_t sent = Upsert(path, /*attr_only=*/false);
+    actions_.push_front({Kind::kWalk, path, "", refresh, std::move(walk)});
     return sent;
   }
   // A path that is no document itself may still hold indexed folders (the
-  // share root of a crashed queue, a renamed share): they are walked, and
-  // what else the index holds below the path goes.
-  const std::vector<std::string> below = FoldersBelow(path);
-  if (below.empty() || !Exists(path, is_dir) || InMetadataFolder(path)) {
+  // share root of a crashed queue, a renamed share): the walk goes down to
+  // them, and what else the index holds below the path goes.
+  if (!exists || !is_dir || InMetadataFolder(path) || FoldersBelow(path).empty()) {
     return Remove(path, /*with_descendants=*/true);
   }
-  LearnKnown(path);
-  actions_.push_front({Kind::kSweep, path, "", false});
-  for (auto it = below.rbegin(); it != below.rend(); ++it) {
-    if (*it != path) actions_.push_front({Kind::kReindex, *it, "", refresh});
-  }
+  actions_.push_front({Kind::kWalk, path, "", refresh, StartWalk(path, refresh)});
   return 0;
 }
 
-void ShareWorker::Walk(const std::string& dir, bool refresh) {
-  std::vector<Action> found;
-  for (const std::string& name : ListDir(dir)) {
-    if (IsMetadataName(name)) continue;
-    const std::string path = dir + "/" + name;
-    bool is_dir = false;
-    if (!Exists(path, is_dir) || rename_targets_.count(path)) continue;
-    const bool unchanged = Unchanged(path);
-    if (refresh || !unchanged) found.push_back({Kind::kUpsert, path, "", false});
-    // Links are documents of their own and never followed.
-    if (is_dir) found.push_back({Kind::kWalk, path, "", refresh});
-  }
-  actions_.insert(actions_.begin(), found.begin(), found.end());
+std::shared_ptr<ShareWorker::SubtreeWalk> ShareWorker::StartWalk(const std::string& dir,
+                                                                 bool refresh) {
+  // Yields the documents below dir and goes down into the directories that
+  // are documents or hold indexed folders. The targets of the batch's
+  // pending renames are left to those renames, which move their documents
+  // instead of reading the files again.
+  auto visit = [this](const std::string& path, bool is_dir) -> OrderedTreeWalk::Visit {
+    if (rename_targets_.count(path) != 0) return {};
+    const bool document = IsDocument(path);
+    return {document, is_dir && (document || !FoldersBelow(path).empty())};
+  };
+  auto walk = std::make_shared<SubtreeWalk>(SubtreeWalk{
+      OrderedTreeWalk(dir, visit), IndexPages(share_, dir + "/", options_.page_size), refresh});
+  walk->index.Peek();  // what the index holds is asked before anything is sent
+  return walk;
 }
 
-void ShareWorker::LearnKnown(const std::string& dir) {
-  Json::Value request(Json::objectValue);
-  request["command"] = "document_get_by_query";
-  request["data"]["id"] = el::GetFileIndexID(share_);
-  request["data"]["query"]["qsl"]["prefix"]["KALOMDPath"] = dir + "/";
-  Json::Value answer;
-  el::SendWithRetry(answer, request);
-  if (!answer["data"].isArray()) {
-    throw Error(kErrorSearchDaemon, "document_get_by_query answer without data: " + dir);
-  }
-  const auto number = [](const Json::Value& v) { return v.isNumeric() ? v.asInt64() : -1; };
-  for (const Json::Value& doc : answer["data"]) {
-    if (!doc["KALOMDPath"].isString()) continue;
-    Known known;
-    known.size = number(doc["KALOMDFSSize"]);
-    known.ctime = number(doc["KALOMDAttributeChangeDate"]);
-    known.mtime = number(doc["KALOMDFSContentChangeDate"]);
-    // A nested walk (a folder below a share root) must not forget what an
-    // outer one has already seen.
-    known_.emplace(doc["KALOMDPath"].asString(), known);
-  }
-}
-
-bool ShareWorker::Unchanged(const std::string& path) {
-  const auto it = known_.find(path);
-  if (it == known_.end()) return false;
-  it->second.seen = true;
-  struct stat st;
-  if (::lstat(path.c_str(), &st) != 0) return false;
-  return it->second.size == st.st_size && it->second.ctime == st.st_ctim.tv_sec &&
-         it->second.mtime == st.st_mtim.tv_sec;
-}
-
-size_t ShareWorker::Sweep(const std::string& dir) {
-  const std::string prefix = dir + "/";
+size_t ShareWorker::WalkSome(const Action& action, size_t& work) {
+  SubtreeWalk& walk = *action.walk;
   size_t sent = 0;
-  auto it = known_.lower_bound(prefix);
-  while (it != known_.end() && StringStartWith(it->first, prefix)) {
-    if (!it->second.seen) {
-      el::IndexDel(share_, it->first);
-      Uncommitted(Kind::kDelete, it->first);
+  while (work < options_.step_budget) {
+    const OrderedTreeWalk::Entry* found = walk.disk.Peek();
+    const IndexPages::Doc* known = walk.index.Peek();
+    if (found == nullptr && known == nullptr) return sent;
+    ++work;
+    if (found == nullptr || (known != nullptr && known->path < found->path)) {
+      // Held by the index, not found by the walk.
+      el::IndexDel(share_, known->path);
+      Uncommitted(Kind::kDelete, known->path);
       ++sent;
+      walk.index.Pop();
+      continue;
     }
-    // Forgotten only once deleted: a failed delete is tried again.
-    it = known_.erase(it);
+    const bool held = known != nullptr && known->path == found->path;
+    const bool unchanged = held && known->size == found->size && known->ctime == found->ctime &&
+                           known->mtime == found->mtime;
+    if (walk.refresh || !unchanged) sent += UpsertFound(found->path);
+    walk.disk.Pop();
+    if (held) walk.index.Pop();
   }
+  actions_.push_front(action);  // the rest at the next step
   return sent;
+}
+
+size_t ShareWorker::UpsertFound(const std::string& path) {
+  try {
+    return Upsert(path, /*attr_only=*/false);
+  } catch (const Error& e) {
+    if (e.code() != kErrorParseDocument) throw;
+    LogPlain("fileindexd: share %s: skipped %s: %s", share_.c_str(), path.c_str(), e.what());
+    return 0;
+  }
 }
 
 size_t ShareWorker::Rename(const std::string& from, const std::string& to) {

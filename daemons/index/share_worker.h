@@ -20,7 +20,6 @@
 #include <ctime>
 #include <deque>
 #include <functional>
-#include <map>
 #include <memory>
 #include <optional>
 #include <set>
@@ -43,8 +42,13 @@ struct WorkerOptions {
   int64_t max_wait_ms = 30000;
   // Documents sent between two commits of the share's index.
   size_t commit_every = 2000;
-  // Document commands per Step, so that the loop returns regularly.
+  // Document commands (or entries a walk compares) per Step, so that the
+  // loop returns regularly, also during a walk that finds nothing changed.
   size_t step_budget = 200;
+  // Documents per answer when a walk lists what the index holds: a walk's
+  // memory is a page and the entries of the directories it is in, however
+  // large the subtree.
+  size_t page_size = 1000;
   // Seconds before a batch that failed (search daemon away) is tried again.
   time_t retry_s = 30;
   // The monotonic clock, in milliseconds, that times the quiet period;
@@ -85,29 +89,15 @@ class ShareWorker {
   const std::string& share() const { return share_; }
 
  private:
-  enum class Kind {
-    kDelete,
-    kDeleteTree,
-    kUpsert,
-    kAttr,
-    kRename,
-    kReindex,
-    kWalk,
-    kSweep,
-    kRefresh
-  };
+  enum class Kind { kDelete, kDeleteTree, kUpsert, kAttr, kRename, kReindex, kWalk, kRefresh };
+  // The disk and the index below a path, side by side in path order.
+  struct SubtreeWalk;
   struct Action {
     Kind kind;
     std::string path;
     std::string from;      // kRename: the old path
     bool refresh = false;  // kReindex, kWalk: read every file again, changed or not
-  };
-  // A document already in the index, as the walk compares it with the file.
-  struct Known {
-    long long size = -1;
-    long long ctime = -1;
-    long long mtime = -1;
-    bool seen = false;
+    std::shared_ptr<SubtreeWalk> walk = nullptr;  // kWalk: where it stands, kept across steps
   };
 
   int64_t NowMs() const;
@@ -115,16 +105,18 @@ class ShareWorker {
   void TakeSnapshot();
   void AddOp(const std::shared_ptr<fileindex::OP>& op);
   // Carries out the front action; may replace it by the actions it expands
-  // into. Returns the number of document commands sent.
-  size_t Perform(const Action& action);
+  // into. Returns the number of document commands sent; adds the work done
+  // (a walk: the entries it compared) to work.
+  size_t Perform(const Action& action, size_t& work);
   size_t Reindex(const std::string& path, bool refresh);
-  void Walk(const std::string& dir, bool refresh);
-  // Learns the documents below dir from the index (kept where known).
-  void LearnKnown(const std::string& dir);
-  // True when the index holds the file as it is now; marks it seen.
-  bool Unchanged(const std::string& path);
-  // Deletes the documents below dir that the walk did not find.
-  size_t Sweep(const std::string& dir);
+  // A walk of the subtree below dir, its first page of documents asked.
+  std::shared_ptr<SubtreeWalk> StartWalk(const std::string& dir, bool refresh);
+  // Compares entries until the step's work is done or the walk is over
+  // (else it goes back to the front): upserts what is new or changed,
+  // deletes what the index holds and the disk no longer does.
+  size_t WalkSome(const Action& action, size_t& work);
+  // Upsert for a file met by a walk; an unreadable one is skipped.
+  size_t UpsertFound(const std::string& path);
   size_t Rename(const std::string& from, const std::string& to);
   // Queues a refresh of the document of path's directory (its times change
   // with its entries), once per batch.
@@ -154,7 +146,6 @@ class ShareWorker {
   WorkerOptions options_;
 
   std::deque<Action> actions_;
-  std::map<std::string, Known> known_;  // by path, while a walk is under way
   // Targets of the batch's renames not carried out yet: a walk leaves them
   // to their rename, which moves their documents instead of reading them.
   std::multiset<std::string> rename_targets_;

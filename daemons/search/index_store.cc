@@ -566,15 +566,33 @@ int64_t IndexStore::DeleteByPrefix(const std::string& prefix) {
   return writer_->Changes();
 }
 
-Json::Value IndexStore::GetByPrefix(const std::string& prefix) {
+Json::Value IndexStore::GetByPrefix(const std::string& prefix, const std::string& after,
+                                    int64_t limit, bool* more) {
   Json::Value out(Json::arrayValue);
-  Statement& get = st_->get_prefix;
-  get.Bind(1, prefix).Bind(2, PrefixUpperBound(prefix));
+  // One lower bound only, the later of the two, so that each page is a seek
+  // in the path index and a walk of many pages stays linear.
+  const bool past = !after.empty() && after >= prefix;
+  std::optional<Statement> paged;
+  if (past || limit >= 0) {
+    paged.emplace(*writer_, std::string("SELECT body FROM documents WHERE path ") +
+                                (past ? ">" : ">=") + " ?1 AND path < ?2 ORDER BY path LIMIT ?3");
+    // One row past the page tells whether more remain.
+    paged->Bind(3, limit < 0 ? int64_t{-1} : limit + 1);
+  }
+  Statement& get = paged ? *paged : st_->get_prefix;
+  get.Bind(1, past ? after : prefix).Bind(2, PrefixUpperBound(prefix));
+  int64_t rows = 0;
+  bool over = false;
   while (get.Step()) {
+    if (limit >= 0 && rows++ == limit) {
+      over = true;
+      break;
+    }
     Json::Value doc;
     if (fromString(doc, get.Text(0))) out.append(std::move(doc));
   }
   get.Reset();
+  if (more != nullptr) *more = over;
   return out;
 }
 

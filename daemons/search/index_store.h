@@ -81,9 +81,13 @@ class IndexStore {
   bool Delete(const std::string& doc_id);
   // Deletes every document whose KALOMDPath begins with prefix; their count.
   int64_t DeleteByPrefix(const std::string& prefix);
-  // The documents whose KALOMDPath begins with prefix, in path order, as
-  // stored (without their text content). Sees uncommitted changes.
-  Json::Value GetByPrefix(const std::string& prefix);
+  // The documents whose KALOMDPath begins with prefix, in path order (bytes),
+  // as stored (without their text content). A non-empty after keeps only
+  // the paths strictly after it; limit >= 0 returns at most that many, and
+  // more (when given) tells whether further ones remain. Sees uncommitted
+  // changes.
+  Json::Value GetByPrefix(const std::string& prefix, const std::string& after = std::string(),
+                          int64_t limit = -1, bool* more = nullptr);
 
   // Makes every change since the last commit durable and visible to searches.
   void Commit();

@@ -458,13 +458,23 @@ Json::Value SearchEngine::DocumentDelete(const Json::Value& data) {
 Json::Value SearchEngine::DocumentQuery(const Json::Value& data, bool remove) {
   const std::string id = CheckIndexId(Member(data, "id"));
   const std::string prefix = PrefixQueryArg(data);
-  IndexStore& store = remove ? WritableStore(id) : Store(id);
   Json::Value answer;
   if (remove) {
-    answer["data"]["deleted"] = static_cast<Json::Int64>(store.DeleteByPrefix(prefix));
-  } else {
-    answer["data"] = store.GetByPrefix(prefix);
+    answer["data"]["deleted"] = static_cast<Json::Int64>(WritableStore(id).DeleteByPrefix(prefix));
+    return answer;
   }
+  // A page ("limit" documents strictly after the path "after") keeps the
+  // answer for a large subtree under the frame cap; "more" tells whether it
+  // was the last. 10,000 stored documents are a few megabytes.
+  constexpr int64_t kMaxPageDocuments = 10000;
+  const std::optional<int64_t> limit = OptionalIntArg(data, "limit");
+  if (limit && (*limit < 1 || *limit > kMaxPageDocuments)) {
+    throw SearchError(kBadArgument, "\"limit\" must be 1 to " + std::to_string(kMaxPageDocuments));
+  }
+  const std::string after = OptionalStringArg(data, "after");
+  bool more = false;
+  answer["data"] = Store(id).GetByPrefix(prefix, after, limit.value_or(-1), &more);
+  if (limit) answer["more"] = more;
   return answer;
 }
 

@@ -107,6 +107,36 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   EXPECT_EQ(Paths{}, HitPaths(SearchName("gamma")));
   CheckFullTextIndexes();
 
+  // Documents of names alone: the newest committed row removed before new
+  // ones come; new ones sent again, renamed or removed before the commit;
+  // an older one renamed.
+  auto remove = [&](const std::string& path) {
+    Json::Value r = Command("document_del_by_id", kId);
+    r["data"]["doc_id"] = path;
+    Ok(r);
+  };
+  Ok(Upsert(kId, FileDoc("/v/s/one.txt")));
+  Ok(Upsert(kId, FileDoc("/v/s/two.txt")));
+  Commit();
+  remove("/v/s/two.txt");
+  Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
+  Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
+  Json::Value four;
+  four["KALOMDSearchFileName"] = "four.txt";
+  Ok(SetById(kId, "/v/s/three.txt", four));
+  Ok(Upsert(kId, FileDoc("/v/s/five.txt")));
+  remove("/v/s/five.txt");
+  Json::Value six;
+  six["KALOMDSearchFileName"] = "six.txt";
+  Ok(SetById(kId, "/v/s/one.txt", six));
+  Commit();
+  for (const char* gone_name : {"one", "two", "three", "five"}) {
+    EXPECT_EQ(Paths{}, HitPaths(SearchName(gone_name))) << gone_name;
+  }
+  EXPECT_EQ(Paths{"/v/s/three.txt"}, HitPaths(SearchName("four")));
+  EXPECT_EQ(Paths{"/v/s/one.txt"}, HitPaths(SearchName("six")));
+  CheckFullTextIndexes();
+
   // Deleted by prefix, committed, and the index is empty of it.
   Ok(PrefixQuery("document_del_by_query", kId, "/v/s/"));
   Commit();
@@ -159,6 +189,35 @@ TEST_F(SearchEngineTest, DeleteByPrefixLeavesTheDirectoryAndItsLookalikeSiblings
   Commit();
   EXPECT_EQ((std::vector<std::string>{"/v/s/a", "/v/s/a.txt", "/v/s/ab", "/v/s/ab/c", "/v/s/b"}),
             DocPaths(GetByPrefix("/v/s/")));
+}
+
+// Pages follow the byte order of whole paths ("/" sorts between "." and
+// "0"), whatever "after" names: a path of the subtree, one that is not
+// stored, or one before the prefix.
+TEST_F(SearchEngineTest, GetByPrefixPagesInPathOrderAfterAGivenPath) {
+  for (const char* path : {"/v/s/a", "/v/s/a/x", "/v/s/a.b", "/v/s/a0", "/v/s/b", "/v/t/c"}) {
+    Ok(Upsert(kId, FileDoc(path)));
+  }
+  const auto page = [&](const char* after, int limit) {
+    Json::Value request = PrefixQuery("document_get_by_query", kId, "/v/s/");
+    if (after != nullptr) request["data"]["after"] = after;
+    request["data"]["limit"] = limit;
+    const Json::Value answer = Ok(request);
+    std::vector<std::string> paths = DocPaths(answer);
+    paths.push_back(answer["more"].asBool() ? "more" : "end");
+    return paths;
+  };
+  using Paths = std::vector<std::string>;
+  EXPECT_EQ((Paths{"/v/s/a", "/v/s/a.b", "more"}), page(nullptr, 2));
+  EXPECT_EQ((Paths{"/v/s/a/x", "/v/s/a0", "more"}), page("/v/s/a.b", 2));
+  EXPECT_EQ((Paths{"/v/s/b", "end"}), page("/v/s/a0", 2));
+  EXPECT_EQ((Paths{"/v/s/a0", "/v/s/b", "end"}), page("/v/s/a/y", 10));
+  EXPECT_EQ((Paths{"/v/s/a", "more"}), page("/v/", 1));
+  EXPECT_EQ((Paths{"end"}), page("/v/s/b", 1));
+  // Without "limit" the answer is the whole subtree, and says nothing more.
+  const Json::Value whole = GetByPrefix("/v/s/");
+  EXPECT_EQ(5u, whole["data"].size());
+  EXPECT_FALSE(whole.isMember("more"));
 }
 
 TEST_F(SearchEngineTest, DeleteByIdRemovesOneDocument) {
@@ -384,6 +443,11 @@ TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
   Json::Value empty_prefix = PrefixQuery("document_del_by_query", kId, "");
   Json::Value bad_query = Command("document_get_by_query", kId);
   bad_query["data"]["query"]["qsl"]["match"]["KALOMDPath"] = "/v";
+  const auto page = [](const char* key, const Json::Value& value) {
+    Json::Value req = PrefixQuery("document_get_by_query", kId, "/v/s/");
+    req["data"][key] = value;
+    return req;
+  };
   Json::Value no_data;
   no_data["command"] = "commit";
   Json::Value relative = Command("index_create", "fileindex_t");
@@ -427,6 +491,11 @@ TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
       {"size as text", size_as_text, search::kBadArgument},
       {"empty prefix", empty_prefix, search::kBadArgument},
       {"query not a prefix", bad_query, search::kBadArgument},
+      {"page limit negative", page("limit", -1), search::kBadArgument},
+      {"page limit zero", page("limit", 0), search::kBadArgument},
+      {"page limit above 10,000", page("limit", 10001), search::kBadArgument},
+      {"page limit beyond 64 bits", page("limit", Json::UInt64(~0ull)), search::kBadArgument},
+      {"page after not a string", page("after", 5), search::kBadArgument},
       {"relative path", relative, search::kBadArgument},
       {"existing id elsewhere", other_path, search::kIndexExists},
       {"unknown sort", search("sort", "colour"), search::kBadArgument},
