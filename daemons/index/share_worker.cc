@@ -56,7 +56,8 @@ ShareWorker::ShareWorker(std::string share, std::string share_root, std::string 
     : share_(std::move(share)),
       share_root_(std::move(share_root)),
       queue_path_(std::move(queue_path)),
-      options_(options) {}
+      options_(options),
+      batch_(share_) {}
 
 void ShareWorker::ScheduleFullWalk() {
   actions_.push_back({Kind::kReindex, share_root_, ""});
@@ -103,11 +104,18 @@ size_t ShareWorker::Step() {
       sent += n;
       CountSent(n);
     }
+    FlushBatch();
     if (actions_.empty()) FinishBatch();
     last_error_.clear();
   } catch (const std::exception& e) {
+    // Sent since the last commit, then gathered but not sent: all again, in
+    // that order, before the action that failed.
+    actions_.insert(actions_.begin(), batched_.begin(), batched_.end());
     actions_.insert(actions_.begin(), uncommitted_.begin(), uncommitted_.end());
     uncommitted_.clear();
+    batched_.clear();
+    batched_paths_.clear();
+    batch_.Clear();
     const auto* error = dynamic_cast<const Error*>(&e);
     if (error != nullptr && error->code() == kErrorNoSpace && !full_walk_) {
       // The share is flagged for a re-index: the batch that commits once
@@ -241,6 +249,7 @@ size_t ShareWorker::Reindex(const std::string& path, bool refresh) {
       const size_t sent = Upsert(path, /*attr_only=*/false);
       // Once a directory (now a file or a link in its place): what the index
       // still holds below it goes.
+      FlushBatch();
       el::IndexDelDir(share_, path);
       Uncommitted(Kind::kReindex, path);
       return sent + 1;
@@ -273,7 +282,12 @@ std::shared_ptr<ShareWorker::SubtreeWalk> ShareWorker::StartWalk(const std::stri
   };
   auto walk = std::make_shared<SubtreeWalk>(SubtreeWalk{
       OrderedTreeWalk(dir, visit), IndexPages(share_, dir + "/", options_.page_size), refresh});
-  walk->index.Peek();  // what the index holds is asked before anything is sent
+  // What the index holds is asked before anything below dir is sent, and
+  // after what was gathered: the listing must see it. Later pages need no
+  // flush: a walk's changes are to paths at or before the last one listed,
+  // and the next page starts after it.
+  FlushBatch();
+  walk->index.Peek();
   return walk;
 }
 
@@ -287,8 +301,7 @@ size_t ShareWorker::WalkSome(const Action& action, size_t& work) {
     ++work;
     if (found == nullptr || (known != nullptr && known->path < found->path)) {
       // Held by the index, not found by the walk.
-      el::IndexDel(share_, known->path);
-      Uncommitted(Kind::kDelete, known->path);
+      Batch(Kind::kDelete, known->path);
       ++sent;
       walk.index.Pop();
       continue;
@@ -317,6 +330,7 @@ size_t ShareWorker::UpsertFound(const std::string& path) {
 size_t ShareWorker::Rename(const std::string& from, const std::string& to) {
   const auto pending = rename_targets_.find(to);
   if (pending != rename_targets_.end()) rename_targets_.erase(pending);
+  FlushBatch();  // the move must find the documents as gathered so far
   const bool from_doc = IsDocument(from);
   const bool to_doc = IsDocument(to);
   if (from_doc && to_doc) {
@@ -358,32 +372,102 @@ size_t ShareWorker::Upsert(const std::string& path, bool attr_only) {
   if (!IsDocument(path)) return 0;
   bool is_dir = false;
   if (!Exists(path, is_dir)) {
-    el::IndexDel(share_, path);  // gone before its turn came
-    Uncommitted(Kind::kDelete, path);
+    Batch(Kind::kDelete, path);  // gone before its turn came
     return 1;
   }
-  if (attr_only) {
-    try {
-      el::IndexAttr(share_, path);
-      Uncommitted(Kind::kAttr, path);
-      return 1;
-    } catch (const Error& e) {
-      // Never indexed (its upsert was skipped): the whole document it is.
-      if (e.code() != kNoSuchDocument) throw;
+  Batch(attr_only ? Kind::kAttr : Kind::kUpsert, path);
+  if (!attr_only && !is_dir) ++total_read_;
+  return 1;
+}
+
+void ShareWorker::Batch(Kind kind, const std::string& path) {
+  if (batched_paths_.count(path) != 0 || batch_.size() >= options_.batch_docs ||
+      batch_.bytes() >= options_.batch_bytes) {
+    FlushBatch();
+  }
+  // Built first: an unreadable file (Error 914) leaves the batch as it was.
+  if (kind == Kind::kUpsert) {
+    batch_.Upsert(path, folders_->IsFullPathNeedMeta(path));
+  } else if (kind == Kind::kAttr) {
+    batch_.Attr(path);
+  } else {
+    batch_.Del(path);
+  }
+  batched_.push_back({kind, path, ""});
+  batched_paths_.insert(path);
+}
+
+void ShareWorker::FlushBatch() {
+  if (batched_.empty()) return;
+  const std::vector<el::DocumentFailure> failures = batch_.Flush();
+  std::vector<Action> refused;
+  std::vector<int> codes;
+  size_t next = 0;
+  for (size_t i = 0; i < batched_.size(); ++i) {
+    if (next < failures.size() && failures[next].index == i) {
+      refused.push_back(batched_[i]);
+      codes.push_back(failures[next].code);
+      ++next;
+    } else {
+      uncommitted_.push_back(batched_[i]);
     }
   }
-  el::IndexUpsert(share_, path, folders_->IsFullPathNeedMeta(path));
-  Uncommitted(Kind::kUpsert, path);
-  if (!is_dir) ++total_read_;
-  return 1;
+  // What was refused stays gathered until it is done, so that a batch that
+  // stops on it sends it again.
+  batched_ = std::move(refused);
+  batched_paths_.clear();
+  for (size_t i = 0; !batched_.empty(); ++i) {
+    SendAlone(batched_.front(), codes[i]);
+    batched_.erase(batched_.begin());
+  }
+}
+
+void ShareWorker::SendAlone(const Action& action, int refused_code) {
+  const std::string& path = action.path;
+  try {
+    if (action.kind == Kind::kDelete) {
+      el::IndexDel(share_, path);
+      Uncommitted(Kind::kDelete, path);
+      return;
+    }
+    if (action.kind == Kind::kAttr) {
+      // Never indexed (its upsert was skipped): the whole document it is.
+      if (refused_code != kNoSuchDocument && AttrAlone(path)) return;
+      bool is_dir = false;
+      if (Exists(path, is_dir) && !is_dir) ++total_read_;
+    }
+    el::IndexUpsert(share_, path, folders_->IsFullPathNeedMeta(path));
+    Uncommitted(Kind::kUpsert, path);
+  } catch (const Error& e) {
+    // Gone or unreadable since it was gathered: its own later event, or the
+    // next re-index, puts it right.
+    if (e.code() != kErrorParseDocument) throw;
+    LogPlain("fileindexd: share %s: skipped %s: %s", share_.c_str(), path.c_str(), e.what());
+  }
+}
+
+bool ShareWorker::AttrAlone(const std::string& path) {
+  try {
+    el::IndexAttr(share_, path);
+  } catch (const Error& e) {
+    if (e.code() != kNoSuchDocument) throw;
+    return false;
+  }
+  Uncommitted(Kind::kAttr, path);
+  return true;
 }
 
 size_t ShareWorker::Remove(const std::string& path, bool with_descendants) {
   if (InMetadataFolder(path)) return 0;  // never a document
+  if (!with_descendants) {
+    Batch(Kind::kDelete, path);
+    return 1;
+  }
+  FlushBatch();  // what was gathered below path goes too
   el::IndexDel(share_, path);
-  if (with_descendants) el::IndexDelDir(share_, path);
-  Uncommitted(with_descendants ? Kind::kDeleteTree : Kind::kDelete, path);
-  return with_descendants ? 2 : 1;
+  el::IndexDelDir(share_, path);
+  Uncommitted(Kind::kDeleteTree, path);
+  return 2;
 }
 
 void ShareWorker::Uncommitted(Kind kind, const std::string& path, const std::string& from) {
@@ -394,18 +478,18 @@ void ShareWorker::CountSent(size_t sent) {
   since_commit_ += sent;
   done_ += sent;
   total_done_ += sent;
-  if (since_commit_ >= options_.commit_every) {
-    el::IndexCommit(share_);
-    since_commit_ = 0;
-    uncommitted_.clear();
-  }
+  if (since_commit_ >= options_.commit_every) Commit();
+}
+
+void ShareWorker::Commit() {
+  FlushBatch();
+  el::IndexCommit(share_);
+  since_commit_ = 0;
+  uncommitted_.clear();
 }
 
 void ShareWorker::FinishBatch() {
-  if (since_commit_ > 0) {
-    el::IndexCommit(share_);
-    since_commit_ = 0;
-  }
+  if (since_commit_ > 0) Commit();
   uncommitted_.clear();
   // Only now, with everything committed, may the snapshot go: a run killed
   // before this point finds it again and starts the batch over.

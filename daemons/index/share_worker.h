@@ -10,7 +10,10 @@
 // batch, and only then is the snapshot deleted; a batch that stops sends what
 // it had not committed again, since the search daemon may have lost it.
 // Directories, whose times change with their entries, are refreshed at the
-// end of the batch. One thread at a time.
+// end of the batch. Document changes go out a few hundred to a compound
+// request, sent before anything that must follow them (a rename, a subtree
+// delete, a listing, a commit) and at the end of each step. One thread at a
+// time.
 #ifndef ORVEX_DAEMONS_INDEX_SHARE_WORKER_H_
 #define ORVEX_DAEMONS_INDEX_SHARE_WORKER_H_
 
@@ -24,9 +27,11 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <unordered_set>
 #include <vector>
 
 #include "orvex/config/folder_mgr.h"
+#include "orvex/elastic.h"
 #include "orvex/queue/op.h"
 
 namespace orvex {
@@ -49,6 +54,11 @@ struct WorkerOptions {
   // memory is a page and the entries of the directories it is in, however
   // large the subtree.
   size_t page_size = 1000;
+  // Document changes (upserts, attribute changes, deletes) sent together as
+  // one compound request: at most this many, and a new one is not added
+  // past about this many bytes of request text.
+  size_t batch_docs = 500;
+  size_t batch_bytes = 4 << 20;
   // Seconds before a batch that failed (search daemon away) is tried again.
   time_t retry_s = 30;
   // The monotonic clock, in milliseconds, that times the quiet period;
@@ -128,6 +138,19 @@ class ShareWorker {
   size_t Remove(const std::string& path, bool with_descendants);
   void FinishBatch();
   void CountSent(size_t sent);
+  // Adds the document change (kUpsert, kAttr or kDelete) of path to the
+  // compound request being gathered, sending that first when it is full or
+  // already holds path (a path's changes keep their order).
+  void Batch(Kind kind, const std::string& path);
+  // Sends the gathered changes; a refused one is carried out again alone, as
+  // a single command, which throws as it always did (an attribute change of a
+  // document the index does not hold becomes an upsert).
+  void FlushBatch();
+  void SendAlone(const Action& action, int refused_code);
+  // The attribute change of path alone; false when the index does not hold
+  // its document.
+  bool AttrAlone(const std::string& path);
+  void Commit();
   // Notes a document command sent since the last commit, to be sent again
   // when the batch stops: the search daemon may lose what it had not
   // committed (killed, or out of space).
@@ -151,6 +174,11 @@ class ShareWorker {
   std::multiset<std::string> rename_targets_;
   std::set<std::string> refresh_;  // directories (and moved items) to refresh
   std::vector<Action> uncommitted_;
+  // The changes gathered in batch_, in its order: noted as uncommitted once
+  // sent, put back in front of the actions when the batch stops first.
+  fileindex::elastic::DocumentBatch batch_;
+  std::vector<Action> batched_;
+  std::unordered_set<std::string> batched_paths_;
   std::unique_ptr<fileindex::FolderMgr> folders_;  // loaded per batch
   bool in_batch_ = false;
   bool from_snapshot_ = false;

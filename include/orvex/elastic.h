@@ -4,7 +4,8 @@
 // GetFileIndexMappings; the share index commands create, delete, pause,
 // resume, rename and move it, and the document commands carry file changes
 // into it. Every command is one request (IndexRename: three) over a fresh
-// connection to the daemon's socket.
+// connection to the daemon's socket; a DocumentBatch sends many document
+// changes as one.
 //
 // A daemon that answers busy (codes 1400, 1401) is waited out: the request
 // is repeated every 15 to 19 minutes, without limit, and the administrators
@@ -12,13 +13,15 @@
 // memory. A call may therefore block for a very long time.
 //
 // Safe for concurrent use: calls share no state (each opens its own
-// connection).
+// connection); a DocumentBatch is one caller's.
 #ifndef ORVEX_ELASTIC_H_
 #define ORVEX_ELASTIC_H_
 
 #include <json/json.h>
 
+#include <cstddef>
 #include <string>
+#include <vector>
 
 #include "orvex/export.h"
 
@@ -90,6 +93,52 @@ ORVEX_EXPORT void IndexDelDir(const std::string& share, const std::string& dir_p
 // reason when the descendants cannot be listed.
 ORVEX_EXPORT void IndexRename(const std::string& share, const std::string& path_from,
                               const std::string& path_to);
+
+// A sub-request of a compound request that the daemon refused: its place in
+// the request, the daemon's code and message.
+struct DocumentFailure {
+  size_t index = 0;
+  int code = 0;
+  std::string msg;
+};
+
+// Document commands for one share gathered and sent together as one compound
+// request, one round trip for many documents. Each sub-request is the very
+// request IndexUpsert, IndexAttr or IndexDel sends, built (the file's content
+// extracted) when it is added. The daemon carries sub-requests out in order,
+// so a caller that needs a change ordered after them (a rename, a delete of a
+// subtree, a listing, a commit) flushes first. Not safe for concurrent use.
+class ORVEX_EXPORT DocumentBatch {
+ public:
+  explicit DocumentBatch(std::string share);
+
+  // Add the sub-request of IndexUpsert, IndexAttr, IndexDel. Upsert and Attr
+  // throw Error 914 as those do, and the batch is then unchanged.
+  void Upsert(const std::string& full_path, bool need_meta);
+  void Attr(const std::string& full_path);
+  void Del(const std::string& full_path);
+
+  size_t size() const { return compound_.size(); }
+  bool empty() const { return compound_.empty(); }
+  // About the size of the request text so far, in bytes.
+  size_t bytes() const { return bytes_; }
+
+  // Sends what the batch holds as one compound request (nothing when it is
+  // empty) and returns the refused sub-requests in order; a busy daemon is
+  // waited out as for every command. The batch is empty afterwards, also
+  // when it throws (Error 913 or the daemon's code for a refused request).
+  std::vector<DocumentFailure> Flush();
+
+  // Forgets what the batch holds without sending it.
+  void Clear();
+
+ private:
+  void Add(Json::Value sub_request);
+
+  std::string share_;
+  Json::Value compound_{Json::arrayValue};
+  size_t bytes_ = 0;
+};
 
 // Commits the share's index. When the commit fails and the share lacks free
 // space, marks the share as needing a re-index (status flag NeedReindex) and

@@ -3,6 +3,8 @@
 #include <unistd.h>
 
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "foundation/check.h"
 #include "orvex/elastic.h"
@@ -53,18 +55,12 @@ bool SubRequestFailed(const Json::Value& element) {
 // again whole; any other failed sub-request is only logged: the rest of the
 // work is done and must not be repeated for one bad item.
 void CheckCompoundAnswer(const Json::Value& res, const Json::Value& req) {
-  const Json::Value& has_fail = res["has_fail"];
-  if (!req.isMember("compound") || !has_fail.isBool() || !has_fail.asBool()) return;
-  const Json::Value& data = res["data"];
-  if (!data.isArray()) return;
-  for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
-    if (!SubRequestFailed(data[i])) continue;
-    int code = 0;
-    std::string msg;
-    ReadDaemonError(data[i], code, msg);
-    if (IsBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
+  if (!req.isMember("compound")) return;
+  for (const DocumentFailure& failure : FailedSubRequests(res)) {
+    if (IsBusyCode(failure.code)) throw Error(static_cast<ErrorCode>(failure.code), failure.msg);
+    const auto index = static_cast<Json::ArrayIndex>(failure.index);
     LogErrno("%s:%d (%d, %u) Compound failed: %s (%d) %s", kLogSource, __LINE__, Pid(), Euid(),
-             toString(req["compound"][i]).c_str(), code, msg.c_str());
+             toString(req["compound"][index]).c_str(), failure.code, failure.msg.c_str());
   }
 }
 
@@ -80,6 +76,21 @@ unsigned long BusyWaitMicros() {
 }
 
 }  // namespace
+
+std::vector<DocumentFailure> FailedSubRequests(const Json::Value& res) {
+  std::vector<DocumentFailure> failures;
+  const Json::Value& has_fail = res["has_fail"];
+  const Json::Value& data = res["data"];
+  if (!has_fail.isBool() || !has_fail.asBool() || !data.isArray()) return failures;
+  for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
+    if (!SubRequestFailed(data[i])) continue;
+    DocumentFailure failure;
+    failure.index = i;
+    ReadDaemonError(data[i], failure.code, failure.msg);
+    failures.push_back(std::move(failure));
+  }
+  return failures;
+}
 
 void SendOnce(Json::Value& res, const Json::Value& req) {
   sdk::DaemonConnection conn(kElasticSockPath);  // closed on every way out

@@ -7,6 +7,10 @@
 
 #include <json/json.h>
 
+#include <vector>
+
+#include "orvex/elastic.h"
+
 namespace orvex {
 namespace fileindex {
 namespace elastic {
@@ -15,6 +19,11 @@ namespace elastic {
 // failure.
 constexpr int kElasticBusy = 1400;
 constexpr int kElasticBusyQueue = 1401;
+
+// The failed sub-requests of the answer to a compound request, in order
+// (none unless the answer has "has_fail" true and a "data" array). Throws as
+// the JSON helpers do for a failed element without "error" "code" and "msg".
+std::vector<DocumentFailure> FailedSubRequests(const Json::Value& response);
 
 // One attempt. request holds "command", "data" (with the index in "data"
 // "id") and, for a compound request, "compound". On return response holds

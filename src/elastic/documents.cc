@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "elastic/channel.h"
+#include "elastic/document_requests.h"
 #include "foundation/check.h"
 #include "orvex/elastic.h"
 #include "orvex/foundation/json.h"
@@ -53,12 +54,12 @@ Json::Value ExtractDocument(const std::string& full_path, bool need_meta) {
   return file_data;
 }
 
-void SendExtracted(const char* command, const std::string& share, const std::string& full_path,
-                   bool need_meta) {
+Json::Value ExtractedRequest(const char* command, const std::string& share,
+                             const std::string& full_path, bool need_meta) {
   Json::Value file_data = ExtractDocument(full_path, need_meta);
   Json::Value req = DocumentRequest(command, share, full_path);
   req["data"]["data"] = std::move(file_data);
-  Send(req);
+  return req;
 }
 
 // The new naming properties of the moved item itself.
@@ -98,17 +99,29 @@ Json::Value MoveDescendant(const Json::Value& doc, const std::string& share,
 
 }  // namespace
 
-void IndexUpsert(const std::string& share, const std::string& full_path, bool need_meta) {
-  SendExtracted("document_upsert_by_id", share, full_path, need_meta);
+Json::Value UpsertRequest(const std::string& share, const std::string& full_path, bool need_meta) {
+  return ExtractedRequest("document_upsert_by_id", share, full_path, need_meta);
 }
 
 // A partial update: the metadata and text content already indexed stay.
+Json::Value AttrRequest(const std::string& share, const std::string& full_path) {
+  return ExtractedRequest("document_set_by_id", share, full_path, /*need_meta=*/false);
+}
+
+Json::Value DelRequest(const std::string& share, const std::string& full_path) {
+  return DocumentRequest("document_del_by_id", share, full_path);
+}
+
+void IndexUpsert(const std::string& share, const std::string& full_path, bool need_meta) {
+  Send(UpsertRequest(share, full_path, need_meta));
+}
+
 void IndexAttr(const std::string& share, const std::string& full_path) {
-  SendExtracted("document_set_by_id", share, full_path, /*need_meta=*/false);
+  Send(AttrRequest(share, full_path));
 }
 
 void IndexDel(const std::string& share, const std::string& full_path) {
-  Send(DocumentRequest("document_del_by_id", share, full_path));
+  Send(DelRequest(share, full_path));
 }
 
 // The "/" keeps the directory's own document and its siblings /a/bc of /a/b

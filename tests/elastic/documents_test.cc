@@ -102,6 +102,44 @@ TEST_F(DocumentsTest, ItemThatCannotBeExaminedIs914AndNothingIsSent) {
   EXPECT_TRUE(peer_.requests().empty());
 }
 
+TEST_F(DocumentsTest, BatchSendsTheSingleCommandsRequestsAsOneCompoundAndReportsRefusals) {
+  std::vector<std::string> paths;
+  for (const char* name : {"a.txt", "b.txt", "c.txt"})
+    paths.push_back(dir_.Write(std::string("volume1/s/") + name, name));
+  IndexUpsert("s", paths[0], /*need_meta=*/true);
+  IndexUpsert("s", paths[1], /*need_meta=*/false);
+  IndexAttr("s", paths[2]);
+  IndexDel("s", paths[0]);
+  const std::vector<Json::Value> singles = peer_.requests();
+  ASSERT_EQ(4u, singles.size());
+
+  peer_.SetResponder([](const Json::Value&) -> FramedPeer::Reply {
+    return R"({"success": true, "has_fail": true, "data": [{"success": true}, {"success": true},
+              {"success": false, "error": {"code": 1107, "msg": "no document"}},
+              {"success": true}]})";
+  });
+  DocumentBatch batch("s");
+  EXPECT_TRUE(batch.Flush().empty());  // nothing to send
+  batch.Upsert(paths[0], /*need_meta=*/true);
+  batch.Upsert(paths[1], /*need_meta=*/false);
+  EXPECT_EQ(914, CodeOf([&] { batch.Attr(root_ + "/gone.txt"); }));
+  batch.Attr(paths[2]);
+  batch.Del(paths[0]);
+  EXPECT_EQ(4u, batch.size());
+  EXPECT_GT(batch.bytes(), toString(singles[0]).size());
+  const std::vector<DocumentFailure> failures = batch.Flush();
+  ASSERT_EQ(5u, peer_.requests().size());
+  Json::Value expected(Json::arrayValue);
+  for (const Json::Value& single : singles) expected.append(single);
+  EXPECT_EQ(expected, peer_.requests().back()["compound"]);
+  ASSERT_EQ(1u, failures.size());
+  EXPECT_EQ(2u, failures[0].index);
+  EXPECT_EQ(1107, failures[0].code);
+  EXPECT_EQ("no document", failures[0].msg);
+  EXPECT_TRUE(batch.empty());
+  EXPECT_EQ(0u, batch.bytes());
+}
+
 TEST_F(DocumentsTest, DeleteAndDeleteDirAddressTheDocumentOrItsDescendants) {
   IndexDel("s", "/v/s/a b.txt");
   IndexDelDir("s", "/v/s/a");

@@ -93,9 +93,11 @@ TEST_F(FileindexdTest, IndexesAQueuedFileTakesCommandsAndStopsCleanly) {
     return !requests.empty() && requests.back()["command"] == "commit";
   }));
   const auto requests = peer_.requests();
-  ASSERT_EQ(requests.size(), 3u);  // the file, its directory, the commit
-  EXPECT_EQ(requests[0]["command"], "document_upsert_by_id");
-  EXPECT_EQ(requests[0]["data"]["doc_id"], file);
+  // One compound request (the file, its directory), then the commit.
+  ASSERT_EQ(requests.size(), 2u);
+  ASSERT_EQ(requests[0]["compound"].size(), 2u);
+  EXPECT_EQ(requests[0]["compound"][0]["command"], "document_upsert_by_id");
+  EXPECT_EQ(requests[0]["compound"][0]["data"]["doc_id"], file);
   EXPECT_TRUE(WaitFor([&] { return !fs::exists(share_ + "/@eaDir/@fileindex/queue.tmp"); }));
 
   Json::Value pause;

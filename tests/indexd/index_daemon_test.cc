@@ -172,13 +172,27 @@ class IndexDaemonTest : public testing::ShareTestRoot {
 
   static bool Exists(const std::string& path) { return std::filesystem::exists(path); }
 
-  // The search daemon's requests, one short line each.
+  // The requests with each compound one replaced by its sub-requests (an
+  // empty one stays): the document commands in the order they take effect.
+  static std::vector<Json::Value> Flat(const std::vector<Json::Value>& requests) {
+    std::vector<Json::Value> out;
+    for (const Json::Value& r : requests) {
+      if (!r.isMember("compound") || r["compound"].empty()) {
+        out.push_back(r);
+        continue;
+      }
+      for (const Json::Value& sub : r["compound"]) out.push_back(sub);
+    }
+    return out;
+  }
+
+  // The search daemon's document commands, one short line each.
   std::vector<std::string> Commands() const {
     std::vector<std::string> out;
-    for (const Json::Value& r : peer_.requests()) {
+    for (const Json::Value& r : Flat(peer_.requests())) {
       const std::string command = r["command"].asString();
       if (r.isMember("compound")) {
-        out.push_back("compound " + std::to_string(r["compound"].size()));
+        out.push_back("compound 0");
       } else if (command == "document_del_by_query" || command == "document_get_by_query") {
         out.push_back(command + " " + r["data"]["query"]["qsl"]["prefix"]["KALOMDPath"].asString());
       } else if (command == "commit") {
@@ -217,8 +231,37 @@ TEST_F(IndexDaemonTest, QueueBecomesDocumentCommandsInOrderThenCommitAndSnapshot
                 // The directory, whose times change with its entries,
                 // and the moved file's change time.
                 "document_upsert_by_id " + docs_, "document_set_by_id " + e, "commit"}));
-  EXPECT_EQ(peer_.requests()[0]["data"]["id"], "fileindex_s");
+  EXPECT_EQ(Flat(peer_.requests())[0]["data"]["id"], "fileindex_s");
   EXPECT_TRUE(peer_.faults().empty());
+}
+
+TEST_F(IndexDaemonTest, ChangesGoOutAsOneCompoundAndAnAttrOfAnUnknownDocumentBecomesAnUpsert) {
+  const std::string a = Touch("a.bin"), b = Touch("b.bin");
+  Append(queue_, Line(4, a));  // attributes of a file the index never got
+  Append(queue_, Line(64, b));
+  peer_.SetResponder([](const Json::Value& request) -> FramedPeer::Reply {
+    if (!request.isMember("compound")) return std::string(FramedPeer::kSuccess);
+    Json::Value answer;
+    answer["success"] = true;
+    answer["has_fail"] = true;
+    for (const Json::Value& sub : request["compound"]) {
+      Json::Value one;
+      one["success"] = sub["command"] != "document_set_by_id";
+      if (!one["success"].asBool()) {
+        one["error"]["code"] = 1107;
+        one["error"]["msg"] = "no such document";
+      }
+      answer["data"].append(one);
+    }
+    return toString(answer);
+  });
+  Start();
+  Drain();
+  EXPECT_EQ(peer_.requests().size(), 3u);  // the compound, the fallback, the commit
+  EXPECT_EQ(Commands(),
+            (std::vector<std::string>{"document_set_by_id " + a, "document_upsert_by_id " + b,
+                                      "document_upsert_by_id " + docs_,
+                                      "document_upsert_by_id " + a, "commit"}));
 }
 
 TEST_F(IndexDaemonTest, SnapshotOfAKilledRunIsProcessedBeforeTheLiveQueue) {
@@ -326,12 +369,12 @@ TEST_F(IndexDaemonTest, QueueIsTakenWhenQuietOrAfterTheLongestWaitOfASteadyStrea
   for (int second = 0; second < 30; second += 3) {
     Append(queue_, Line(2, a));
     daemon_->RunOnce(0);
-    EXPECT_EQ(peer_.requests().size(), 3u) << "taken early, at second " << second;
+    EXPECT_EQ(Commands().size(), 3u) << "taken early, at second " << second;
     now_ += 3;
   }
   Append(queue_, Line(2, a));
   Drain();
-  EXPECT_EQ(peer_.requests().size(), 6u);
+  EXPECT_EQ(Commands().size(), 6u);
 }
 
 TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
@@ -347,9 +390,10 @@ TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
   FramedPeer back(dir_.Join("var/run/kaloelasticd.sock"));
   now_ += 30;
   Drain();
-  EXPECT_EQ(back.requests().size(), 4u);
-  EXPECT_EQ(back.requests()[0]["data"]["doc_id"], a);
-  EXPECT_EQ(back.requests()[3]["command"], "commit");
+  const std::vector<Json::Value> sent = Flat(back.requests());
+  ASSERT_EQ(sent.size(), 4u);
+  EXPECT_EQ(sent[0]["data"]["doc_id"], a);
+  EXPECT_EQ(sent[3]["command"], "commit");
 }
 
 TEST_F(IndexDaemonTest, WhatAFailedCommitMayHaveLostIsSentAgainAndANeverIndexedSourceIsSkipped) {
@@ -455,7 +499,7 @@ TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
   EXPECT_FALSE(daemon_->HasWorker("s"));
   Append(queue_, Line(64, a));
   for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
-  EXPECT_EQ(peer_.requests().size(), 3u);
+  EXPECT_EQ(Commands().size(), 3u);
   EXPECT_TRUE(Exists(queue_));
 }
 
