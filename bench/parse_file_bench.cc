@@ -54,12 +54,15 @@
 #include "kalo/kalo_content_extract.h"
 #include "orvex/portable/extract_protocol.h"
 #include "orvex/portable/root.h"
+#include "proc_stats.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using orvex::bench::Children;
 using orvex::bench::Report;
 using orvex::bench::SecondsOf;
+using orvex::bench::StatusKiB;
 namespace gen = orvex::extract::testing;
 
 constexpr char kUsage[] =
@@ -465,40 +468,6 @@ class Daemon {
 
   pid_t pid_ = -1;
 };
-
-// A number of kB from a "Name:   1234 kB" line of /proc/<pid>/status; -1
-// when absent.
-long StatusKiB(pid_t pid, const std::string& name) {
-  std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-  std::string line;
-  while (std::getline(status, line)) {
-    if (line.compare(0, name.size() + 1, name + ":") == 0) {
-      return std::strtol(line.c_str() + name.size() + 1, nullptr, 10);
-    }
-  }
-  return -1;
-}
-
-// The processes whose parent is pid, from /proc/<n>/stat.
-std::vector<pid_t> Children(pid_t parent) {
-  std::vector<pid_t> children;
-  for (const fs::directory_entry& entry : fs::directory_iterator("/proc")) {
-    const std::string name = entry.path().filename().string();
-    if (name.find_first_not_of("0123456789") != std::string::npos) continue;
-    std::ifstream stat(entry.path() / "stat");
-    std::string text;
-    std::getline(stat, text);
-    // pid (comm) state ppid ...: comm may hold spaces and parentheses.
-    const size_t close = text.rfind(')');
-    if (close == std::string::npos) continue;
-    char state = 0;
-    int ppid = 0;
-    if (std::sscanf(text.c_str() + close + 1, " %c %d", &state, &ppid) == 2 && ppid == parent) {
-      children.push_back(static_cast<pid_t>(std::stol(name)));
-    }
-  }
-  return children;
-}
 
 // ---- Extraction --------------------------------------------------------
 

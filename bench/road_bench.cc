@@ -52,11 +52,17 @@
 #include "kalo/kalo_sock.h"
 #include "orvex/foundation/json.h"
 #include "orvex/portable/root.h"
+#include "proc_stats.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using orvex::bench::Children;
 using orvex::bench::Clock;
+using orvex::bench::KiBToMiB;
+using orvex::bench::Percentile;
+using orvex::bench::ProcessorSeconds;
+using orvex::bench::ProcNumber;
 using orvex::bench::Report;
 using orvex::bench::Seconds;
 using orvex::testing::ProgramOutcome;
@@ -180,63 +186,6 @@ std::string FindProgram(const std::string& name) {
 }
 
 std::string ProgramDir() { return fs::read_symlink("/proc/self/exe").parent_path().string(); }
-
-// A number from /proc/PID/FILE's line "KEY: N ..."; -1 when absent.
-long long ProcNumber(pid_t pid, const char* file, const std::string& key) {
-  std::ifstream in("/proc/" + std::to_string(pid) + "/" + file);
-  for (std::string line; std::getline(in, line);) {
-    if (line.compare(0, key.size() + 1, key + ":") == 0) {
-      return std::atoll(line.c_str() + key.size() + 1);
-    }
-  }
-  return -1;
-}
-
-double KiBToMiB(long long kib) { return static_cast<double>(kib) / 1024; }
-
-// The processor seconds (user and system) pid has used so far.
-double CpuSeconds(pid_t pid) {
-  std::ifstream in("/proc/" + std::to_string(pid) + "/stat");
-  std::string text;
-  std::getline(in, text);
-  const size_t close = text.rfind(')');
-  if (close == std::string::npos) return 0;
-  std::istringstream fields(text.substr(close + 2));
-  std::string field;
-  unsigned long long utime = 0;
-  unsigned long long stime = 0;
-  // After the name: state is field 3, utime 14 and stime 15.
-  for (int i = 3; i <= 13; ++i) fields >> field;
-  fields >> utime >> stime;
-  return static_cast<double>(utime + stime) / static_cast<double>(::sysconf(_SC_CLK_TCK));
-}
-
-// The pids whose parent is parent (the extraction daemon's workers).
-std::vector<pid_t> ChildrenOf(pid_t parent) {
-  std::vector<pid_t> children;
-  for (const auto& entry : fs::directory_iterator("/proc")) {
-    const std::string name = entry.path().filename().string();
-    if (name.find_first_not_of("0123456789") != std::string::npos) continue;
-    std::ifstream stat(entry.path() / "stat");
-    std::string text;
-    std::getline(stat, text);
-    const size_t close = text.rfind(')');
-    if (close == std::string::npos) continue;
-    char state = 0;
-    int ppid = 0;
-    if (std::sscanf(text.c_str() + close + 1, " %c %d", &state, &ppid) == 2 && ppid == parent) {
-      children.push_back(static_cast<pid_t>(std::atoi(name.c_str())));
-    }
-  }
-  return children;
-}
-
-double Percentile(std::vector<double> values, double fraction) {
-  if (values.empty()) return 0;
-  std::sort(values.begin(), values.end());
-  const size_t at = static_cast<size_t>(fraction * static_cast<double>(values.size() - 1) + 0.5);
-  return values[std::min(at, values.size() - 1)];
-}
 
 void WriteFile(const std::string& path, const std::string& text) {
   std::ofstream out(path, std::ios::binary);
@@ -383,8 +332,7 @@ class System {
     for (const char* daemon : kDaemonNames) {
       const pid_t pid = Pid(daemon);
       kib += std::max(0LL, ProcNumber(pid, "status", "VmHWM"));
-      for (pid_t child : ChildrenOf(pid))
-        kib += std::max(0LL, ProcNumber(child, "status", "VmHWM"));
+      for (pid_t child : Children(pid)) kib += std::max(0LL, ProcNumber(child, "status", "VmHWM"));
     }
     return KiBToMiB(kib);
   }
@@ -394,7 +342,7 @@ class System {
   // worker through a read too.
   long long ExtractionReads() const {
     long long reads = 0;
-    for (pid_t worker : ChildrenOf(Pid("kalocontentextractd"))) {
+    for (pid_t worker : Children(Pid("kalocontentextractd"))) {
       reads += std::max(0LL, ProcNumber(worker, "io", "syscr"));
     }
     return reads;
@@ -406,8 +354,8 @@ class System {
     std::vector<double> seconds;
     for (const char* daemon : kDaemonNames) {
       const pid_t pid = Pid(daemon);
-      seconds.push_back(CpuSeconds(pid));
-      for (pid_t child : ChildrenOf(pid)) seconds.back() += CpuSeconds(child);
+      seconds.push_back(ProcessorSeconds(pid));
+      for (pid_t child : Children(pid)) seconds.back() += ProcessorSeconds(child);
     }
     return seconds;
   }
@@ -695,11 +643,20 @@ class RoadBench {
     });
     const long long reads_before = system.ExtractionReads();
     const std::vector<double> cpu_before = system.CpuEach();
-    Json::Value below(Json::objectValue);
-    below["folder"] = to;
+    Json::Value below_from(Json::objectValue), below_to(Json::objectValue);
+    below_from["folder"] = from;
+    below_to["folder"] = to;
     const Clock::time_point start = Clock::now();
     if (::rename(from.c_str(), to.c_str()) != 0) throw std::runtime_error("cannot rename " + from);
-    const double seconds = UntilTotal(system, below, n, start, 600);
+    // A search counts large totals only up to a bound, but the move is one
+    // commit: searchable once nothing is left below the old path (a count
+    // of 0 is exact) and something is below the new one.
+    double seconds = -1;
+    while (system.SearchTotal(below_from) != 0 || system.SearchTotal(below_to) == 0) {
+      if (Seconds(start) > 600) break;
+      SleepPoll();
+    }
+    if (Seconds(start) <= 600) seconds = Seconds(start);
     const long long reads = system.ExtractionReads() - reads_before;
     Note("  processor time: " + system.CpuText(cpu_before));
     std::printf(
