@@ -41,7 +41,7 @@ struct WorkerOptions {
   // Milliseconds the live queue must stay unchanged before it is taken:
   // long enough that a burst (an untar, a checkout) becomes one batch,
   // short enough that a single save is searchable within a second.
-  int64_t quiet_ms = 250;
+  int64_t quiet_ms = 150;
   // A queue that never stops growing is taken this long after its first
   // line was seen, so a steady stream is still indexed.
   int64_t max_wait_ms = 30000;

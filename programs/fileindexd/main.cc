@@ -26,7 +26,7 @@ constexpr char kIdent[] = "fileindexd";
 constexpr int kExitFailure = 1;
 // The idle poll doubles as the watch on the share queues: a change waits at
 // most this long to be noticed, at the cost of one stat per share.
-constexpr int kStepMs = 100;
+constexpr int kStepMs = 50;
 constexpr char kPidPath[] = "/var/run/fileindexd.pid";
 
 constexpr char kUsage[] =
