@@ -1,5 +1,9 @@
 #include "index/index_daemon.h"
 
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
 #include <exception>
 #include <utility>
 
@@ -83,9 +87,35 @@ void IndexDaemon::RunOnce(int timeout_ms) {
     for (const auto& [share, worker] : workers_) work |= worker->HasWork();
   }
   const auto handler = [this](const Json::Value& request) { return HandleCommand(request); };
+  serving_ = true;
   if (server_.Poll(work ? 0 : timeout_ms, wake_fd_, handler)) woken_ = true;
+  serving_ = false;
   if (Paused()) return;
   for (const auto& [share, worker] : workers_) worker->Step();
+}
+
+void IndexDaemon::WaitServing(unsigned long micros) {
+  if (serving_ || woken_) {
+    if (woken_) throw StopRequested();
+    ::usleep(static_cast<useconds_t>(std::min<unsigned long>(micros, 999999)));
+    return;
+  }
+  const auto handler = [this](const Json::Value& request) {
+    if (request["type"] == "status") return HandleCommand(request);
+    return ErrorAnswer(kErrorSearchDaemon,
+                       "the search daemon is busy and indexing waits for it; try again later");
+  };
+  const auto end = std::chrono::steady_clock::now() + std::chrono::microseconds(micros);
+  serving_ = true;
+  for (auto now = std::chrono::steady_clock::now(); now < end && !woken_;
+       now = std::chrono::steady_clock::now()) {
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(end - now).count();
+    if (server_.Poll(static_cast<int>(std::min<int64_t>(left + 1, 1000)), wake_fd_, handler)) {
+      woken_ = true;
+    }
+  }
+  serving_ = false;
+  if (woken_) throw StopRequested();
 }
 
 Json::Value IndexDaemon::HandleCommand(const Json::Value& request) {

@@ -13,6 +13,7 @@
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <stdexcept>
 #include <string>
 
 #include "index/command_server.h"
@@ -28,6 +29,12 @@ struct IndexDaemonOptions {
   // At LOG_DEBUG every queue line is written to the log, which costs more
   // than indexing it under a storm; below it only failures are.
   int log_level = LOG_INFO;
+};
+
+// Thrown out of a wait when the daemon is asked to stop.
+class StopRequested : public std::runtime_error {
+ public:
+  StopRequested() : std::runtime_error("the indexing daemon is stopping") {}
 };
 
 class IndexDaemon {
@@ -54,6 +61,16 @@ class IndexDaemon {
 
   bool woken() const { return woken_; }
 
+  // A wait of micros inside the library, such as the quarter of an hour it
+  // waits after each busy answer of the search daemon: meanwhile the command
+  // socket still answers "status" (other commands, which could change the
+  // worker that is waiting, are answered "try again"), and a stop signal
+  // ends the wait by throwing StopRequested through the library to the
+  // worker, whose batch is then found again from its snapshot at the next
+  // start. A wait that begins while a command is being answered is a plain
+  // sleep. Install it as the process's sleep hook.
+  void WaitServing(unsigned long micros);
+
   // Answers one command: "pause", "resume", "worker_create",
   // "worker_delete", "notify_setting_changed" and "status".
   Json::Value HandleCommand(const Json::Value& request);
@@ -71,6 +88,7 @@ class IndexDaemon {
 
   IndexDaemonOptions options_;
   CommandServer server_;
+  bool serving_ = false;  // inside server_.Poll: a wait must not poll again
   int wake_fd_ = -1;
   bool woken_ = false;
   int64_t resume_time_ = -1;

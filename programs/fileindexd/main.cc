@@ -12,9 +12,11 @@
 #include <cstring>
 #include <iostream>
 #include <string>
+#include <utility>
 
 #include "index/index_daemon.h"
 #include "orvex/communication.h"
+#include "orvex/foundation/system_hooks.h"
 #include "orvex/portable/daemon_process.h"
 #include "orvex/portable/file_descriptor.h"
 #include "orvex/portable/root.h"
@@ -70,6 +72,11 @@ int Serve(const Options& opt) {
     return kExitFailure;
   }
   daemon.set_wake_fd(stop.get());
+  // The library's long waits (a busy search daemon) keep the command socket
+  // answering and end at a stop signal.
+  orvex::SystemHooks hooks;
+  hooks.sleep_for = [&daemon](unsigned long micros) { daemon.WaitServing(micros); };
+  const orvex::ScopedSystemHooks waits(std::move(hooks));
   const std::string pid_path = orvex::portable::RootPath(kPidPath);
   if (!orvex::portable::AnnounceReady(ready, pid_path)) return kExitFailure;
   syslog(LOG_INFO, "listening on %s", options.server.socket_path.c_str());

@@ -12,7 +12,10 @@
 #include <string>
 #include <thread>
 
+#include "kalo/kalo_sock.h"
 #include "orvex/communication.h"
+#include "orvex/foundation/error.h"
+#include "orvex/foundation/json.h"
 #include "support/framed_peer.h"
 #include "support/run_program.h"
 #include "support/temp_dir.h"
@@ -72,6 +75,20 @@ class FileindexdTest : public ::testing::Test {
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   }
 
+  // One command's whole answer (the library's client reads and drops it).
+  Json::Value Ask(const std::string& type) {
+    Json::Value request;
+    request["type"] = type;
+    kalodaemon::DomainSockConnection connection(socket_);
+    std::string text;
+    Json::Value answer;
+    if (!connection.Connect() || !connection.Send(toString(request)) || !connection.Recv(text) ||
+        !fromString(answer, text)) {
+      return Json::Value();
+    }
+    return answer;
+  }
+
   testing::TempDir dir_;
   testing::ScopedOrvexRoot orvex_root_{dir_.path()};
   const std::string share_ = dir_.Join("volume1/s");
@@ -107,6 +124,27 @@ TEST_F(FileindexdTest, IndexesAQueuedFileTakesCommandsAndStopsCleanly) {
 
   EXPECT_EQ(0, Stop());
   EXPECT_FALSE(fs::exists(socket_));
+}
+
+TEST_F(FileindexdTest, WhileTheSearchDaemonIsBusyStatusIsAnsweredAndAStopEndsTheWait) {
+  const std::string file = docs_ + "/a.bin";
+  std::ofstream(file) << "a";
+  std::ofstream(share_ + "/@eaDir/@fileindex/queue")
+      << R"({"event": 64, "is_dir": false, "path": ")" << file << "\"}\n";
+  peer_.SetResponder([](const Json::Value&) -> testing::FramedPeer::Reply {
+    return std::string(R"({"success": false, "error": {"code": 1400, "msg": "busy"}})");
+  });
+  Start();
+  // The library now waits a quarter of an hour before it asks again.
+  ASSERT_TRUE(WaitFor([&] { return !peer_.requests().empty(); }));
+  EXPECT_TRUE(Ask("status")["data"]["shares"].isMember("s"));
+  EXPECT_EQ(Ask("resume")["error"]["code"], kErrorSearchDaemon);
+
+  const auto asked = std::chrono::steady_clock::now();
+  EXPECT_EQ(0, Stop());
+  EXPECT_LT(std::chrono::steady_clock::now() - asked, std::chrono::seconds(10));
+  // The batch is kept for the next start.
+  EXPECT_TRUE(fs::exists(share_ + "/@eaDir/@fileindex/queue.tmp"));
 }
 
 TEST(FileindexdProgramTest, HelpVersionAndBadUsage) {
