@@ -35,10 +35,18 @@ constexpr int64_t kJournalSizeLimit = 64 << 20;
 // indexed is simply no longer noted. The notes are empty between commits,
 // and a rolled-back transaction takes its notes with it.
 //
+// New documents, the bulk of a load, are not noted one by one: a
+// transaction numbers its new rows itself, from the id in unindexed_from
+// up, so that "not yet in name_grams" is, for them, their id alone. Only
+// older rows renamed in the transaction are noted in unindexed_names.
+//
 // Only the columns that searches filter or sort on are indexed: every other
 // index would be written on each insert and never read. (The owner filter
 // is not one: no command sets it, and where it is used it narrows a name or
-// word match that is already small.)
+// word match that is already small. Nor is the type: each of its six values
+// holds a good share of a share's files, so that the name index read in
+// order finds a page of one type about as soon, and an index on it would
+// gather the whole type and sort it.)
 constexpr char kSchema[] = R"sql(
 CREATE TABLE IF NOT EXISTS meta(key TEXT PRIMARY KEY, value TEXT NOT NULL);
 CREATE TABLE IF NOT EXISTS documents(
@@ -57,13 +65,14 @@ DROP INDEX IF EXISTS documents_parent;
 DROP INDEX IF EXISTS documents_ctime;
 DROP INDEX IF EXISTS documents_crtime;
 DROP INDEX IF EXISTS documents_owner;
-CREATE INDEX IF NOT EXISTS documents_type ON documents(type);
+DROP INDEX IF EXISTS documents_type;
 CREATE INDEX IF NOT EXISTS documents_extension ON documents(extension);
 CREATE INDEX IF NOT EXISTS documents_size ON documents(size);
 CREATE INDEX IF NOT EXISTS documents_mtime ON documents(mtime);
 CREATE INDEX IF NOT EXISTS documents_folded_name ON documents(folded_name, path);
 CREATE TABLE IF NOT EXISTS contents(id INTEGER PRIMARY KEY, text TEXT NOT NULL, props TEXT NOT NULL);
 CREATE TABLE IF NOT EXISTS unindexed_names(id INTEGER PRIMARY KEY);
+CREATE TABLE IF NOT EXISTS unindexed_from(id INTEGER NOT NULL);
 CREATE TABLE IF NOT EXISTS unindexed_words(id INTEGER PRIMARY KEY);
 CREATE VIRTUAL TABLE IF NOT EXISTS name_grams USING fts5(
   folded_name, content='documents', content_rowid='id', tokenize='orvex_name_grams',
@@ -77,22 +86,25 @@ DROP TRIGGER IF EXISTS documents_au;
 DROP TRIGGER IF EXISTS contents_ai;
 DROP TRIGGER IF EXISTS contents_ad;
 DROP TRIGGER IF EXISTS contents_au;
-CREATE TRIGGER IF NOT EXISTS documents_added AFTER INSERT ON documents BEGIN
-  INSERT INTO unindexed_names(id) VALUES (new.id);
-END;
-CREATE TRIGGER IF NOT EXISTS documents_removed AFTER DELETE ON documents BEGIN
+DROP TRIGGER IF EXISTS documents_added;
+DROP TRIGGER IF EXISTS documents_removed;
+DROP TRIGGER IF EXISTS documents_renamed;
+CREATE TRIGGER IF NOT EXISTS documents_deleted AFTER DELETE ON documents BEGIN
   INSERT INTO name_grams(name_grams, rowid, folded_name)
     SELECT 'delete', old.id, old.folded_name
-    WHERE NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
+    WHERE old.id < ifnull((SELECT id FROM unindexed_from), old.id + 1)
+      AND NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
   DELETE FROM unindexed_names WHERE id = old.id;
   DELETE FROM contents WHERE id = old.id;
 END;
-CREATE TRIGGER IF NOT EXISTS documents_renamed AFTER UPDATE OF folded_name ON documents
+CREATE TRIGGER IF NOT EXISTS documents_refolded AFTER UPDATE OF folded_name ON documents
 WHEN old.folded_name IS NOT new.folded_name BEGIN
   INSERT INTO name_grams(name_grams, rowid, folded_name)
     SELECT 'delete', old.id, old.folded_name
-    WHERE NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
-  INSERT OR IGNORE INTO unindexed_names(id) VALUES (new.id);
+    WHERE old.id < ifnull((SELECT id FROM unindexed_from), old.id + 1)
+      AND NOT EXISTS (SELECT 1 FROM unindexed_names WHERE id = old.id);
+  INSERT OR IGNORE INTO unindexed_names(id)
+    SELECT new.id WHERE new.id < ifnull((SELECT id FROM unindexed_from), new.id + 1);
 END;
 CREATE TRIGGER IF NOT EXISTS contents_added AFTER INSERT ON contents BEGIN
   INSERT INTO unindexed_words(id) VALUES (new.id);
@@ -245,7 +257,10 @@ struct IndexStore::Statements {
              "SELECT d.id, d.body, c.text FROM documents d LEFT JOIN contents c ON c.id = d.id "
              "WHERE d.path = ?1"),
         insert(w, std::string("INSERT INTO documents(") + kColumns +
-                      ") VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11, ?12, ?13)"),
+                      ", id) VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11, ?12, ?13, ?14)"),
+        insert_new(w, std::string("INSERT INTO documents(") + kColumns +
+                          ", id) VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11, ?12, ?13, "
+                          "?14) ON CONFLICT(path) DO NOTHING"),
         update(w,
                "UPDATE documents SET path = ?1, parent = ?2, name = ?3, folded_name = ?4, "
                "type = ?5, extension = ?6, is_dir = ?7, size = ?8, mtime = ?9, ctime = ?10, "
@@ -260,22 +275,28 @@ struct IndexStore::Statements {
         remove_prefix(w, "DELETE FROM documents WHERE path >= ?1 AND path < ?2"),
         get_prefix(w, "SELECT body FROM documents WHERE path >= ?1 AND path < ?2 ORDER BY path"),
         begin(w, "BEGIN IMMEDIATE"),
+        last_id(w, "SELECT ifnull(max(id), 0) FROM documents"),
+        mark_new(w, "INSERT INTO unindexed_from(id) VALUES (?1)"),
         savepoint(w, "SAVEPOINT command"),
         release(w, "RELEASE command"),
         rollback_to(w, "ROLLBACK TO command"),
         index_names(w,
-                    "INSERT INTO name_grams(rowid, folded_name) SELECT d.id, d.folded_name "
-                    "FROM unindexed_names u JOIN documents d ON d.id = u.id ORDER BY u.id"),
+                    "INSERT INTO name_grams(rowid, folded_name) "
+                    "SELECT id, folded_name FROM ("
+                    "SELECT d.id, d.folded_name FROM unindexed_names u CROSS JOIN documents d "
+                    "ON d.id = u.id UNION ALL SELECT id, folded_name FROM documents "
+                    "WHERE id >= (SELECT id FROM unindexed_from)) ORDER BY id"),
         forget_names(w, "DELETE FROM unindexed_names"),
+        forget_new(w, "DELETE FROM unindexed_from"),
         index_words(w,
                     "INSERT INTO words(rowid, text, props) SELECT c.id, c.text, c.props "
                     "FROM unindexed_words u JOIN contents c ON c.id = u.id ORDER BY u.id"),
         forget_words(w, "DELETE FROM unindexed_words"),
         commit(w, "COMMIT"),
         rollback(w, "ROLLBACK") {}
-  Statement find, load, insert, update, insert_content, update_content, remove_content, remove,
-      remove_prefix, get_prefix, begin, savepoint, release, rollback_to, index_names, forget_names,
-      index_words, forget_words, commit, rollback;
+  Statement find, load, insert, insert_new, update, insert_content, update_content, remove_content,
+      remove, remove_prefix, get_prefix, begin, last_id, mark_new, savepoint, release, rollback_to,
+      index_names, forget_names, forget_new, index_words, forget_words, commit, rollback;
 };
 
 IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
@@ -346,15 +367,24 @@ void IndexStore::SetMappings(const Json::Value& mappings) {
 bool IndexStore::InTransaction() const { return sqlite3_get_autocommit(writer_->handle()) == 0; }
 
 void IndexStore::Begin() {
-  if (!InTransaction()) st_->begin.Run();
+  if (InTransaction()) return;
+  st_->begin.Run();
+  Statement& last = st_->last_id;
+  last.Step();
+  next_id_ = last.Int(0) + 1;
+  last.Reset();
+  st_->mark_new.Bind(1, next_id_).Run();
 }
 
 void IndexStore::Commit() {
   if (!InTransaction()) return;
   // The rows written since the last commit enter the full-text tables in
-  // rowid order, in one pass each.
+  // rowid order, in one pass each. (The notes lead the join: read in row id
+  // order for the merge with the new rows, the documents would be scanned
+  // whole at every commit.)
   st_->index_names.Run();
   st_->forget_names.Run();
+  st_->forget_new.Run();
   st_->index_words.Run();
   st_->forget_words.Run();
   st_->commit.Run();
@@ -405,7 +435,8 @@ std::optional<int64_t> IndexStore::FindId(const std::string& path) {
   return id;
 }
 
-IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value& doc) const {
+IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value& doc,
+                                    std::string_view doc_text) const {
   Row row;
   row.path = doc["KALOMDPath"].isString() ? doc["KALOMDPath"].asString() : doc_id;
   const size_t slash = row.path.rfind('/');
@@ -433,10 +464,10 @@ IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value
   for (const std::string& name : text_properties_) AppendText(doc[name], row.props);
   // The body is the document with its path and without its text content.
   // The indexer's documents of names and attributes already are: they are
-  // written out as they are, without a copy.
+  // kept as they came, or written out without a copy.
   const Json::Value* path = doc.find("KALOMDPath", "KALOMDPath" + 10);
   if (path != nullptr && path->isString() && !doc.isMember("KALOMDTextContent")) {
-    row.body = JsonText(doc);
+    row.body = doc_text.empty() ? JsonText(doc) : std::string(doc_text);
   } else {
     Json::Value body = doc;
     body["KALOMDPath"] = row.path;
@@ -465,6 +496,17 @@ void BindRow(Statement& s, const std::string& path, const std::string& parent,
 
 }  // namespace
 
+bool IndexStore::InsertNew(const Row& row) {
+  Statement& s = st_->insert_new;
+  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
+  BindOptional(s, 8, row.size);
+  BindOptional(s, 9, row.mtime);
+  BindOptional(s, 10, row.ctime);
+  BindOptional(s, 11, row.crtime);
+  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, next_id_++).Run();
+  return writer_->Changes() == 1;
+}
+
 void IndexStore::Insert(const Row& row) {
   Statement& s = st_->insert;
   BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
@@ -472,7 +514,7 @@ void IndexStore::Insert(const Row& row) {
   BindOptional(s, 9, row.mtime);
   BindOptional(s, 10, row.ctime);
   BindOptional(s, 11, row.crtime);
-  s.Bind(12, row.owner).Bind(13, row.body).Run();
+  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, next_id_++).Run();
   if (!row.HasWords()) return;
   st_->insert_content.Bind(1, writer_->LastInsertRowid()).Bind(2, row.text).Bind(3, row.props);
   st_->insert_content.Run();
@@ -494,15 +536,22 @@ void IndexStore::Update(int64_t id, const Row& row) {
   }
 }
 
-void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc) {
+void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc,
+                        std::string_view doc_text) {
   CheckTypes(doc);
-  const Row row = MakeRow(doc_id, doc);
+  const Row row = MakeRow(doc_id, doc, doc_text);
   Begin();
   // A new document without words is one statement, which SQLite makes whole
-  // or undoes by itself: no savepoint around it.
-  if (!row.HasWords() && !FindId(doc_id) && (row.path == doc_id || !FindId(row.path))) {
-    Insert(row);
-    return;
+  // or undoes by itself: no savepoint around it. Sent at its own path, it
+  // is simply inserted, unless the path is taken (the statement then does
+  // nothing): the path index is searched once, not twice.
+  if (!row.HasWords()) {
+    if (row.path == doc_id) {
+      if (InsertNew(row)) return;
+    } else if (!FindId(doc_id) && !FindId(row.path)) {
+      Insert(row);
+      return;
+    }
   }
   Atomically([&] {
     // A document sent again keeps its row, and its full-text entries when

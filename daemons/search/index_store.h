@@ -70,9 +70,12 @@ class IndexStore {
   // checked on every write. Part of the next commit.
   void SetMappings(const Json::Value& mappings);
 
-  // Replaces (or adds) the document doc_id with doc. Throws kBadArgument when
-  // a property has the wrong type.
-  void Upsert(const std::string& doc_id, const Json::Value& doc);
+  // Replaces (or adds) the document doc_id with doc. doc_text, when not
+  // empty, is the JSON text doc was parsed from: stored as it is when it
+  // needs no change, instead of being written out again. Throws
+  // kBadArgument when a property has the wrong type.
+  void Upsert(const std::string& doc_id, const Json::Value& doc,
+              std::string_view doc_text = std::string_view());
   // Sets the members of changes in document doc_id, keeping the others; a new
   // KALOMDPath moves the document (replacing any other at that path). Throws
   // kNoSuchDocument when there is no such document.
@@ -122,8 +125,11 @@ class IndexStore {
   auto Atomically(Change change);
   void CheckTypes(const Json::Value& doc) const;
   std::optional<int64_t> FindId(const std::string& path);
-  Row MakeRow(const std::string& doc_id, const Json::Value& doc) const;
+  Row MakeRow(const std::string& doc_id, const Json::Value& doc,
+              std::string_view doc_text = std::string_view()) const;
   void Insert(const Row& row);
+  // Inserts row unless its path is taken; false when it was.
+  bool InsertNew(const Row& row);
   void Update(int64_t id, const Row& row);
   void LoadMappings();
 
@@ -131,6 +137,9 @@ class IndexStore {
   std::unique_ptr<SqliteDb> writer_;
   std::unique_ptr<SqliteDb> reader_;
   std::unique_ptr<Statements> st_;
+  // The id of the next new row: new rows of a transaction are numbered from
+  // the one kept in unindexed_from, above every row before it.
+  int64_t next_id_ = 1;
   // property -> "int", "double", "bool", "string", "text"
   std::map<std::string, std::string, std::less<>> types_;
   std::vector<std::string> text_properties_;  // those searched as words

@@ -28,6 +28,16 @@ const Json::Value& Member(const Json::Value& data, const char* key) {
   return data[key];
 }
 
+// The part of text that value was parsed from; empty when value was not
+// parsed from text (built by a caller) or its offsets do not fit.
+std::string_view SourceText(const Json::Value& value, std::string_view text) {
+  const auto start = static_cast<size_t>(value.getOffsetStart());
+  const auto limit = static_cast<size_t>(value.getOffsetLimit());
+  if (start >= limit || limit > text.size()) return std::string_view();
+  const std::string_view part = text.substr(start, limit - start);
+  return part.front() == '{' && part.back() == '}' ? part : std::string_view();
+}
+
 std::string StringArg(const Json::Value& data, const char* key) {
   const Json::Value& v = Member(data, key);
   if (!v.isString())
@@ -253,11 +263,12 @@ Json::Value SearchEngine::ErrorAnswer(int code, const std::string& msg) {
   return answer;
 }
 
-Json::Value SearchEngine::Handle(const Json::Value& request, const Caller& caller) {
+Json::Value SearchEngine::Handle(const Json::Value& request, const Caller& caller,
+                                 std::string_view text) {
   try {
     if (!request.isObject()) throw SearchError(kBadJson, "the request is not a JSON object");
-    if (request.isMember("compound")) return Compound(request["compound"], caller);
-    return Dispatch(request, caller);
+    if (request.isMember("compound")) return Compound(request["compound"], caller, text);
+    return Dispatch(request, caller, text);
   } catch (const SearchError& e) {
     return ErrorAnswer(e.code(), e.what());
   } catch (const std::exception& e) {
@@ -266,7 +277,8 @@ Json::Value SearchEngine::Handle(const Json::Value& request, const Caller& calle
   }
 }
 
-Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& caller) {
+Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& caller,
+                                   std::string_view text) {
   if (!items.isArray()) throw SearchError(kBadArgument, "\"compound\" must be an array");
   Json::Value answer;
   answer["success"] = true;
@@ -277,7 +289,7 @@ Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& calle
     if (item.isObject() && item.isMember("compound")) {
       result = ErrorAnswer(kBadArgument, "a compound request cannot hold another");
     } else {
-      result = Handle(item, caller);
+      result = Handle(item, caller, text);
     }
     if (!result["success"].asBool()) answer["has_fail"] = true;
     answer["data"].append(std::move(result));
@@ -285,7 +297,8 @@ Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& calle
   return answer;
 }
 
-Json::Value SearchEngine::Dispatch(const Json::Value& request, const Caller& caller) {
+Json::Value SearchEngine::Dispatch(const Json::Value& request, const Caller& caller,
+                                   std::string_view text) {
   const std::string command = StringArg(request, "command");
   const Json::Value& data = ObjectArg(request, "data");
   Json::Value answer;
@@ -300,9 +313,9 @@ Json::Value SearchEngine::Dispatch(const Json::Value& request, const Caller& cal
   } else if (command == "index_config_set") {
     answer = IndexConfigSet(data);
   } else if (command == "document_upsert_by_id") {
-    answer = DocumentWrite(data, /*merge=*/false);
+    answer = DocumentWrite(data, /*merge=*/false, text);
   } else if (command == "document_set_by_id") {
-    answer = DocumentWrite(data, /*merge=*/true);
+    answer = DocumentWrite(data, /*merge=*/true, text);
   } else if (command == "document_del_by_id") {
     answer = DocumentDelete(data);
   } else if (command == "document_del_by_query") {
@@ -433,7 +446,8 @@ Json::Value SearchEngine::IndexConfigSet(const Json::Value& data) {
   return Json::Value(Json::objectValue);
 }
 
-Json::Value SearchEngine::DocumentWrite(const Json::Value& data, bool merge) {
+Json::Value SearchEngine::DocumentWrite(const Json::Value& data, bool merge,
+                                        std::string_view text) {
   const std::string id = CheckIndexId(Member(data, "id"));
   const std::string doc_id = StringArg(data, "doc_id");
   if (doc_id.empty()) throw SearchError(kBadArgument, "\"doc_id\" must not be empty");
@@ -442,7 +456,7 @@ Json::Value SearchEngine::DocumentWrite(const Json::Value& data, bool merge) {
   if (merge) {
     store.Set(doc_id, doc);
   } else {
-    store.Upsert(doc_id, doc);
+    store.Upsert(doc_id, doc, SourceText(doc, text));
   }
   return Json::Value(Json::objectValue);
 }

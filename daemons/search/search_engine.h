@@ -11,6 +11,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include "search/index_registry.h"
 #include "search/index_store.h"
@@ -35,21 +36,24 @@ class SearchEngine {
 
   // The answer to request: {"success": true[, "data": ...]} or {"success":
   // false, "error": {"code", "msg"}}; a compound request gets one result per
-  // sub-request in "data" and "has_fail". Never throws.
-  Json::Value Handle(const Json::Value& request, const Caller& caller);
+  // sub-request in "data" and "has_fail". text, when not empty, is the JSON
+  // text request was parsed from (its values' offsets point into it): the
+  // documents written are stored as they came. Never throws.
+  Json::Value Handle(const Json::Value& request, const Caller& caller,
+                     std::string_view text = std::string_view());
 
   // An answer with "success" false.
   static Json::Value ErrorAnswer(int code, const std::string& msg);
 
  private:
-  Json::Value Dispatch(const Json::Value& request, const Caller& caller);
-  Json::Value Compound(const Json::Value& items, const Caller& caller);
+  Json::Value Dispatch(const Json::Value& request, const Caller& caller, std::string_view text);
+  Json::Value Compound(const Json::Value& items, const Caller& caller, std::string_view text);
 
   Json::Value IndexCreate(const Json::Value& data);
   Json::Value IndexDelete(const Json::Value& data);
   Json::Value IndexPause(const Json::Value& data, bool paused);
   Json::Value IndexConfigSet(const Json::Value& data);
-  Json::Value DocumentWrite(const Json::Value& data, bool merge);
+  Json::Value DocumentWrite(const Json::Value& data, bool merge, std::string_view text);
   Json::Value DocumentDelete(const Json::Value& data);
   Json::Value DocumentQuery(const Json::Value& data, bool remove);
   Json::Value Commit(const Json::Value& data);

@@ -201,7 +201,7 @@ void SearchServer::OnFrame(Connection& c) {
     body.pop_back();
     Json::Value request;
     answer = fromString(request, body)
-                 ? engine_.Handle(request, c.caller)
+                 ? engine_.Handle(request, c.caller, body)
                  : SearchEngine::ErrorAnswer(kBadJson, "the request is not JSON text");
   }
   Answer(c, JsonText(answer), /*close_after=*/false);
