@@ -487,34 +487,31 @@ void BindOptional(Statement& s, int index, const std::optional<int64_t>& v) {
   }
 }
 
-void BindRow(Statement& s, const std::string& path, const std::string& parent,
-             const std::string& name, const std::string& folded, const std::string& type,
-             const std::string& extension, bool is_dir) {
-  s.Bind(1, path).Bind(2, parent).Bind(3, name).Bind(4, folded).Bind(5, type).Bind(6, extension);
-  s.Bind(7, int64_t{is_dir});
+// Binds a row's columns, in the order of kColumns, as ?1 to ?13.
+template <typename Row>
+void BindRow(Statement& s, const Row& row) {
+  s.Bind(1, row.path).Bind(2, row.parent).Bind(3, row.name).Bind(4, row.folded_name);
+  s.Bind(5, row.type).Bind(6, row.extension).Bind(7, int64_t{row.is_dir});
+  BindOptional(s, 8, row.size);
+  BindOptional(s, 9, row.mtime);
+  BindOptional(s, 10, row.ctime);
+  BindOptional(s, 11, row.crtime);
+  s.Bind(12, row.owner).Bind(13, row.body);
 }
 
 }  // namespace
 
 bool IndexStore::InsertNew(const Row& row) {
   Statement& s = st_->insert_new;
-  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
-  BindOptional(s, 8, row.size);
-  BindOptional(s, 9, row.mtime);
-  BindOptional(s, 10, row.ctime);
-  BindOptional(s, 11, row.crtime);
-  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, next_id_++).Run();
+  BindRow(s, row);
+  s.Bind(14, next_id_++).Run();
   return writer_->Changes() == 1;
 }
 
 void IndexStore::Insert(const Row& row) {
   Statement& s = st_->insert;
-  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
-  BindOptional(s, 8, row.size);
-  BindOptional(s, 9, row.mtime);
-  BindOptional(s, 10, row.ctime);
-  BindOptional(s, 11, row.crtime);
-  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, next_id_++).Run();
+  BindRow(s, row);
+  s.Bind(14, next_id_++).Run();
   if (!row.HasWords()) return;
   st_->insert_content.Bind(1, writer_->LastInsertRowid()).Bind(2, row.text).Bind(3, row.props);
   st_->insert_content.Run();
@@ -522,12 +519,8 @@ void IndexStore::Insert(const Row& row) {
 
 void IndexStore::Update(int64_t id, const Row& row) {
   Statement& s = st_->update;
-  BindRow(s, row.path, row.parent, row.name, row.folded_name, row.type, row.extension, row.is_dir);
-  BindOptional(s, 8, row.size);
-  BindOptional(s, 9, row.mtime);
-  BindOptional(s, 10, row.ctime);
-  BindOptional(s, 11, row.crtime);
-  s.Bind(12, row.owner).Bind(13, row.body).Bind(14, id).Run();
+  BindRow(s, row);
+  s.Bind(14, id).Run();
   // Only when the words changed: a rename must not re-index a book's text.
   if (row.HasWords()) {
     st_->update_content.Bind(1, id).Bind(2, row.text).Bind(3, row.props).Run();

@@ -12,10 +12,9 @@
 #include <string>
 #include <thread>
 
-#include "kalo/kalo_sock.h"
 #include "orvex/communication.h"
 #include "orvex/foundation/error.h"
-#include "orvex/foundation/json.h"
+#include "support/ask_daemon.h"
 #include "support/framed_peer.h"
 #include "support/run_program.h"
 #include "support/temp_dir.h"
@@ -79,14 +78,7 @@ class FileindexdTest : public ::testing::Test {
   Json::Value Ask(const std::string& type) {
     Json::Value request;
     request["type"] = type;
-    kalodaemon::DomainSockConnection connection(socket_);
-    std::string text;
-    Json::Value answer;
-    if (!connection.Connect() || !connection.Send(toString(request)) || !connection.Recv(text) ||
-        !fromString(answer, text)) {
-      return Json::Value();
-    }
-    return answer;
+    return testing::AskDaemon(socket_, request);
   }
 
   testing::TempDir dir_;

@@ -21,11 +21,11 @@
 #include <thread>
 #include <vector>
 
-#include "kalo/kalo_sock.h"
 #include "orvex/foundation/json.h"
 #include "orvex/policy/custom_event.h"
 #include "orvex/queue/event.h"
 #include "programs/program_test.h"
+#include "support/ask_daemon.h"
 
 namespace orvex {
 namespace testing {
@@ -153,14 +153,7 @@ class StormTest : public ProgramTest {
   // One framed request to the daemon serving socket (under the root); its
   // answer, null when it does not answer.
   Json::Value Ask(const std::string& socket, const Json::Value& request) {
-    kalodaemon::DomainSockConnection connection(root_.Join(socket));
-    std::string text;
-    Json::Value answer;
-    if (!connection.Connect() || !connection.Send(toString(request)) || !connection.Recv(text) ||
-        !fromString(answer, text)) {
-      return Json::Value();
-    }
-    return answer;
+    return AskDaemon(root_.Join(socket), request);
   }
 
   // The indexing daemon's status of the share; null when it does not answer.
