@@ -3,10 +3,12 @@
 #include <fcntl.h>
 #include <signal.h>
 #include <sys/signalfd.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
+#include <iostream>
 
 #include "orvex/portable/atomic_file.h"
 
@@ -115,6 +117,17 @@ void DaemonFlagParser::Parse(int argc, char** argv) const {
     if (i + 1 >= argc) throw DaemonUsageError(arg + " needs a value");
     option->take(argv[++i]);
   }
+}
+
+int StartFailed(const char* ident, const std::string& why) {
+  syslog(LOG_ERR, "%s", why.c_str());
+  std::cerr << ident << ": " << why << "\n";
+  return 1;
+}
+
+void EndServing(bool foreground, const std::string& pid_path) {
+  if (!foreground) ::unlink(pid_path.c_str());
+  syslog(LOG_INFO, "stopped");
 }
 
 }  // namespace portable

@@ -10,7 +10,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <iostream>
 #include <string>
 #include <utility>
 
@@ -65,12 +64,10 @@ int Serve(const Options& opt) {
       orvex::portable::RootPath(orvex::fileindex::kFileIndexDaemonSockPath);
   orvex::indexd::IndexDaemon daemon(options);
   std::string why;
-  if (!stop || !daemon.Start(why)) {
-    if (!stop) why = std::string("signalfd failed: ") + std::strerror(errno);
-    syslog(LOG_ERR, "%s", why.c_str());
-    std::cerr << kIdent << ": " << why << "\n";
-    return kExitFailure;
-  }
+  if (!stop)
+    return orvex::portable::StartFailed(kIdent,
+                                        std::string("signalfd failed: ") + std::strerror(errno));
+  if (!daemon.Start(why)) return orvex::portable::StartFailed(kIdent, why);
   daemon.set_wake_fd(stop.get());
   // The library's long waits (a busy search daemon) keep the command socket
   // answering and end at a stop signal.
@@ -83,8 +80,7 @@ int Serve(const Options& opt) {
   // A batch interrupted here is found again from its snapshot at the next
   // start: nothing is lost by stopping between steps.
   while (!daemon.woken()) daemon.RunOnce(kStepMs);
-  if (!opt.foreground) ::unlink(pid_path.c_str());
-  syslog(LOG_INFO, "stopped");
+  orvex::portable::EndServing(opt.foreground, pid_path);
   return 0;
 }
 

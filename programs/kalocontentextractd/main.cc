@@ -13,7 +13,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <iostream>
 #include <string>
 
 #include "extract_service.h"
@@ -107,10 +106,8 @@ int Serve(const Options& opt) {
   options.memory_mb = opt.memory_mb;
   ExtractService service(options, kalocontentextractd::MakeExtractor());
   if (!stop || !service.Start()) {
-    const std::string why = "cannot listen on " + options.socket_path + ": " + std::strerror(errno);
-    syslog(LOG_ERR, "%s", why.c_str());
-    std::cerr << kIdent << ": " << why << "\n";
-    return kExitFailure;
+    return orvex::portable::StartFailed(
+        kIdent, "cannot listen on " + options.socket_path + ": " + std::strerror(errno));
   }
   service.set_wake_fd(stop.get());
   const std::string pid_path = RootPath(orvex::portable::kExtractPidPath);
@@ -119,8 +116,7 @@ int Serve(const Options& opt) {
   while (!service.RunOnce(kRoundMs)) {
   }
   service.Stop();
-  if (!opt.foreground) ::unlink(pid_path.c_str());
-  syslog(LOG_INFO, "stopped");
+  orvex::portable::EndServing(opt.foreground, pid_path);
   return 0;
 }
 

@@ -12,7 +12,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <iostream>
 #include <memory>
 #include <string>
 
@@ -68,11 +67,6 @@ void RaiseDescriptorLimit() {
   }
 }
 
-void Complain(const std::string& why) {
-  syslog(LOG_ERR, "%s", why.c_str());
-  std::cerr << kIdent << ": " << why << "\n";
-}
-
 int Serve(const Options& opt) {
   orvex::FileDescriptor ready;
   const int started = orvex::portable::DetachUnlessForeground(opt.foreground, ready);
@@ -85,15 +79,14 @@ int Serve(const Options& opt) {
     engine =
         std::make_unique<orvex::search::SearchEngine>(RootPath(orvex::search::kIndexRegistryPath));
   } catch (const orvex::search::SearchError& e) {
-    Complain(e.what());
-    return kExitFailure;
+    return orvex::portable::StartFailed(kIdent, e.what());
   }
   orvex::search::ServerOptions options;
   options.socket_path = RootPath(orvex::search::kSearchSocketPath);
   orvex::search::SearchServer server(options, *engine);
   if (!stop || !server.Start()) {
-    Complain("cannot listen on " + options.socket_path + ": " + std::strerror(errno));
-    return kExitFailure;
+    return orvex::portable::StartFailed(
+        kIdent, "cannot listen on " + options.socket_path + ": " + std::strerror(errno));
   }
   server.set_wake_fd(stop.get());
   const std::string pid_path = RootPath(kPidPath);
@@ -103,8 +96,7 @@ int Serve(const Options& opt) {
   }
   server.Stop();
   engine.reset();  // drops what was not committed
-  if (!opt.foreground) ::unlink(pid_path.c_str());
-  syslog(LOG_INFO, "stopped");
+  orvex::portable::EndServing(opt.foreground, pid_path);
   return 0;
 }
 

@@ -13,7 +13,6 @@
 #include <chrono>
 #include <cstring>
 #include <ctime>
-#include <iostream>
 #include <string>
 
 #include "kalo/kalo_notify.h"
@@ -88,12 +87,10 @@ int Serve(const Options& opt) {
   options.registry_dir = RootPath(KALO::KALONOTIFYD::kMonitorRegistryDir);
   orvex::watch::Watcher watcher(options);
   std::string why;
-  if (!stop || !watcher.Start(why)) {
-    if (!stop) why = std::string("signalfd failed: ") + std::strerror(errno);
-    syslog(LOG_ERR, "%s", why.c_str());
-    std::cerr << kIdent << ": " << why << "\n";
-    return kExitFailure;
-  }
+  if (!stop)
+    return orvex::portable::StartFailed(kIdent,
+                                        std::string("signalfd failed: ") + std::strerror(errno));
+  if (!watcher.Start(why)) return orvex::portable::StartFailed(kIdent, why);
   watcher.set_wake_fd(stop.get());
   const std::string pid_path = RootPath(KALO::KALONOTIFYD::kNotifyPidPath);
   if (!orvex::portable::AnnounceReady(ready, pid_path)) return kExitFailure;
@@ -115,8 +112,7 @@ int Serve(const Options& opt) {
   for (int round = 0; round < kFinalRounds && watcher.RunOnce(0) > 0; ++round) {
   }
   WriteStatus(watcher, /*running=*/false);
-  if (!opt.foreground) ::unlink(pid_path.c_str());
-  syslog(LOG_INFO, "stopped");
+  orvex::portable::EndServing(opt.foreground, pid_path);
   return 0;
 }
 

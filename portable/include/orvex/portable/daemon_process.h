@@ -38,6 +38,15 @@ int DetachUnlessForeground(bool foreground, FileDescriptor& ready);
 // invalid). False with errno set when the starter could not be told.
 bool AnnounceReady(FileDescriptor& ready, const std::string& pid_path);
 
+// A daemon that cannot start says why in the system log (opened by the
+// caller) and on standard error, which a foreground run still has; returns
+// the exit status for it, 1.
+int StartFailed(const char* ident, const std::string& why);
+
+// A daemon's orderly end: the pid file a detached run wrote is removed and
+// the stop is logged.
+void EndServing(bool foreground, const std::string& pid_path);
+
 // Bad usage of a daemon's command line: DaemonMain prints it with the usage.
 class DaemonUsageError : public std::runtime_error {
  public:
