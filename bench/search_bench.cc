@@ -14,9 +14,10 @@
 // - where installed, plocate on the same names (its database built by
 //   updatedb over the same tree) and recollq on the same words, as ratios.
 //
-//   build/search_bench [DOCUMENTS] [--commit-every N] [--keep]
+//   build/search_bench [DOCUMENTS] [--commit-every N] [--keep] [--load-only]
 //   (1,000,000 documents by default; the daemon is the kaloelasticd built
-//   beside this program; --keep leaves the share and index in place)
+//   beside this program; --keep leaves the share and index in place;
+//   --load-only stops after the loads, for profiles of the write path)
 #include <fcntl.h>
 #include <json/json.h>
 #include <pwd.h>
@@ -370,7 +371,15 @@ std::string TextOf(int i, std::mt19937& random) {
   return text;
 }
 
-int Run(int count, int commit_every, bool keep) {
+struct Options {
+  int count = 1000000;
+  int commit_every = 10000;
+  bool keep = false;
+  bool load_only = false;
+};
+
+int Run(const Options& options) {
+  const int count = options.count, commit_every = options.commit_every;
   char dir_template[] = "/tmp/search-bench-XXXXXX";
   if (::mkdtemp(dir_template) == nullptr) return 1;
   const std::string dir = dir_template;
@@ -442,6 +451,12 @@ int Run(int count, int commit_every, bool keep) {
   std::printf("database: %.1f MB, %.0f bytes per document (%d documents)\n", bytes / (1 << 20),
               bytes / count, count);
   std::fflush(stdout);
+  if (options.load_only) {
+    std::printf("daemon peak resident memory: %.1f MB\n",
+                static_cast<double>(StatusKiB(daemon.pid(), "VmHWM")) / 1024);
+    fs::remove_all(dir);
+    return pass ? 0 : 1;
+  }
 
   std::printf("name fragments (top 50), checked:\n");
   bool same = true;
@@ -494,7 +509,7 @@ int Run(int count, int commit_every, bool keep) {
 
   ComparePlocate(share, dir, name_p50);
   CompareRecoll(dir, recoll_texts, text_p50);
-  if (keep) {
+  if (options.keep) {
     std::printf("kept: %s\n", dir.c_str());
   } else {
     fs::remove_all(dir);
@@ -505,25 +520,26 @@ int Run(int count, int commit_every, bool keep) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  int count = 1000000;
-  int commit_every = 10000;
-  bool keep = false;
+  Options options;
   for (int i = 1; i < argc; ++i) {
     const std::string arg = argv[i];
     if (arg == "--commit-every" && i + 1 < argc) {
-      commit_every = std::atoi(argv[++i]);
+      options.commit_every = std::atoi(argv[++i]);
     } else if (arg == "--keep") {
-      keep = true;
+      options.keep = true;
+    } else if (arg == "--load-only") {
+      options.load_only = true;
     } else if (!arg.empty() && std::isdigit(static_cast<unsigned char>(arg[0]))) {
-      count = std::atoi(arg.c_str());
+      options.count = std::atoi(arg.c_str());
     } else {
-      std::fprintf(stderr, "usage: search_bench [DOCUMENTS] [--commit-every N] [--keep]\n");
+      std::fprintf(stderr,
+                   "usage: search_bench [DOCUMENTS] [--commit-every N] [--keep] [--load-only]\n");
       return 2;
     }
   }
-  if (count < kTextEvery || commit_every <= 0) return 2;
+  if (options.count < kTextEvery || options.commit_every <= 0) return 2;
   try {
-    return Run(count, commit_every, keep);
+    return Run(options);
   } catch (const std::exception& e) {
     std::fprintf(stderr, "search_bench: %s\n", e.what());
     return 1;

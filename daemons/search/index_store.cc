@@ -315,6 +315,8 @@ IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
   reader_->Exec("PRAGMA busy_timeout=5000");
   st_ = std::make_unique<Statements>(*writer_);
   LoadMappings();
+  checkpointer_ = std::make_unique<WalCheckpointer>(path);
+  checkpointer_->Install(writer_->handle());
 }
 
 IndexStore::~IndexStore() {
@@ -326,7 +328,14 @@ IndexStore::~IndexStore() {
     } catch (const SearchError&) {
     }
   }
+  StopCheckpoints();
   st_.reset();
+}
+
+void IndexStore::StopCheckpoints() {
+  if (!checkpointer_) return;
+  WalCheckpointer::Uninstall(writer_->handle());
+  checkpointer_.reset();
 }
 
 void IndexStore::LoadMappings() {
@@ -655,6 +664,7 @@ Json::Value IndexStore::Stats() {
 
 void IndexStore::Close() {
   Commit();
+  StopCheckpoints();
   st_.reset();
   reader_.reset();
   writer_->Exec("PRAGMA wal_checkpoint(TRUNCATE)");

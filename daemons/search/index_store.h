@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "search/sqlite_db.h"
+#include "search/wal_checkpointer.h"
 
 namespace orvex {
 namespace search {
@@ -132,11 +133,13 @@ class IndexStore {
   bool InsertNew(const Row& row);
   void Update(int64_t id, const Row& row);
   void LoadMappings();
+  void StopCheckpoints();
 
   std::string path_;
   std::unique_ptr<SqliteDb> writer_;
   std::unique_ptr<SqliteDb> reader_;
   std::unique_ptr<Statements> st_;
+  std::unique_ptr<WalCheckpointer> checkpointer_;
   // The id of the next new row: new rows of a transaction are numbered from
   // the one kept in unindexed_from, above every row before it.
   int64_t next_id_ = 1;
