@@ -15,6 +15,7 @@
 // lower bound (SearchResult::exact).
 #include <algorithm>
 #include <cmath>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -65,34 +66,76 @@ std::string NameMatch(const std::string& folded) {
   return Quoted(folded) + (CodePointCount(folded) < kTrigram ? "*" : "");
 }
 
-// The user's words, "phrases" and prefix* as an FTS5 expression: every term
-// quoted, so that no user text is read as FTS5 syntax (AND, NEAR, column
-// filters). Terms are ANDed.
+// One term of a text query as the user wrote it: a word, a word* or a
+// "phrase", each quoted for FTS5 so that no user text is read as FTS5
+// syntax (AND, NEAR, column filters); a leading "-" excludes it.
+struct TextTerm {
+  std::string match;  // empty: nothing searchable ("*", "", "-")
+  bool excluded = false;
+  bool is_or = false;  // the bare word OR
+};
+
+TextTerm NextTextTerm(const std::string& query, size_t& i) {
+  TextTerm term;
+  if (query[i] == '-') {
+    term.excluded = true;
+    ++i;
+  }
+  if (i < query.size() && query[i] == '"') {
+    const size_t end = query.find('"', i + 1);
+    const std::string phrase =
+        query.substr(i + 1, end == std::string::npos ? std::string::npos : end - i - 1);
+    if (!phrase.empty()) term.match = Quoted(phrase);
+    i = end == std::string::npos ? query.size() : end + 1;
+    return term;
+  }
+  size_t end = query.find_first_of(" \t\"", i);
+  if (end == std::string::npos) end = query.size();
+  std::string word = query.substr(i, end - i);
+  i = end;
+  term.is_or = !term.excluded && word == "OR";
+  const bool prefix = word.size() > 1 && word.back() == '*';
+  if (prefix) word.pop_back();
+  if (!word.empty() && word != "*") term.match = Quoted(word) + (prefix ? "*" : "");
+  return term;
+}
+
+// The user's query as an FTS5 expression: terms are ANDed, "a OR b" is
+// either, and excluded terms are taken out of the rest. ("cat OR dog food
+// -fish" is ((cat OR dog) AND food) NOT fish.)
 std::string TextMatch(const std::string& query) {
-  std::vector<std::string> terms;
+  std::vector<std::vector<std::string>> all_of;  // each holds its alternatives
+  std::vector<std::string> excluded;
+  bool or_next = false;
   size_t i = 0;
   while (i < query.size()) {
     if (query[i] == ' ' || query[i] == '\t') {
       ++i;
-    } else if (query[i] == '"') {
-      const size_t end = query.find('"', i + 1);
-      const std::string phrase =
-          query.substr(i + 1, end == std::string::npos ? std::string::npos : end - i - 1);
-      if (!phrase.empty()) terms.push_back(Quoted(phrase));
-      i = end == std::string::npos ? query.size() : end + 1;
-    } else {
-      size_t end = query.find_first_of(" \t\"", i);
-      if (end == std::string::npos) end = query.size();
-      std::string word = query.substr(i, end - i);
-      const bool prefix = word.size() > 1 && word.back() == '*';
-      if (prefix) word.pop_back();
-      if (!word.empty() && word != "*") terms.push_back(Quoted(word) + (prefix ? "*" : ""));
-      i = end;
+      continue;
     }
+    const TextTerm term = NextTextTerm(query, i);
+    if (term.is_or && !all_of.empty()) {
+      or_next = true;
+    } else if (term.match.empty()) {
+      continue;
+    } else if (term.excluded) {
+      excluded.push_back(term.match);
+    } else if (or_next) {
+      all_of.back().push_back(term.match);
+    } else {
+      all_of.push_back({term.match});
+    }
+    if (!term.is_or) or_next = false;
   }
-  if (terms.empty()) throw SearchError(kBadArgument, "the text query has no words");
+  if (all_of.empty()) throw SearchError(kBadArgument, "the text query has no words to find");
   std::string match;
-  for (const std::string& term : terms) match += (match.empty() ? "" : " ") + term;
+  for (const std::vector<std::string>& either : all_of) {
+    std::string group;
+    for (const std::string& term : either) group += (group.empty() ? "" : " OR ") + term;
+    if (either.size() > 1) group = "(" + group + ")";
+    match += (match.empty() ? "" : " AND ") + group;
+  }
+  for (const std::string& term : excluded) match = "(" + match + ") NOT " + term;
   return match;
 }
 
@@ -327,6 +370,59 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
   return result;
 }
 
+// Whether an FTS5 expression of TextMatch holds a prefix term ("word"*). A
+// phrase that begins with "* " looks like one too, which only costs it the
+// single pass below.
+bool HasPrefixTerm(const std::string& match) {
+  for (size_t p = match.find("\"*"); p != std::string::npos; p = match.find("\"*", p + 1)) {
+    const size_t after = p + 2;
+    if (after == match.size() || match[after] == ' ' || match[after] == ')') return true;
+  }
+  return false;
+}
+
+// The page's hits, each with its snippet, in the page's order. FTS5 finds
+// one document of a query by its rowid cheaply, except for a prefix term,
+// whose matching words it gathers afresh each time the query starts: then
+// one pass over the matches makes every snippet of the page.
+std::vector<SearchHit> Snippets(SqliteDb& db, const std::string& match,
+                                const std::vector<std::pair<int64_t, double>>& page) {
+  if (page.empty()) return {};
+  const std::string select = std::string("SELECT ") + kHitColumns +
+                             ", snippet(words, -1, '[', ']', '...', 12), words.rowid FROM words "
+                             "CROSS JOIN documents d ON d.id = words.rowid WHERE words MATCH ?1";
+  std::map<int64_t, SearchHit> found;
+  auto take = [&found](Statement& s) {
+    SearchHit hit = ReadHit(s);
+    hit.snippet = s.Text(kHitColumnCount);
+    found.emplace(s.Int(kHitColumnCount + 1), std::move(hit));
+  };
+  if (HasPrefixTerm(match)) {
+    std::string ids;
+    for (const auto& entry : page) ids += (ids.empty() ? "" : ",") + std::to_string(entry.first);
+    // The unary + keeps the rowids from FTS5, which would seek (and gather)
+    // once per id.
+    Statement all(db, select + " AND +words.rowid IN (" + ids + ")");
+    all.Bind(1, match);
+    while (all.Step()) take(all);
+  } else {
+    Statement one(db, select + " AND words.rowid = ?2");
+    for (const auto& entry : page) {
+      one.Bind(1, match).Bind(2, entry.first);
+      if (one.Step()) take(one);
+      one.Reset();
+    }
+  }
+  std::vector<SearchHit> hits;
+  for (const auto& [id, rank] : page) {
+    const auto it = found.find(id);
+    if (it == found.end()) continue;
+    hits.push_back(std::move(it->second));
+    hits.back().rank = rank;
+  }
+  return hits;
+}
+
 // Words: the page's ids by the query's order first, then a snippet for
 // each of them alone.
 SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
@@ -347,18 +443,7 @@ SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
   order.Bind(next, need);
   std::vector<std::pair<int64_t, double>> page;
   while (order.Step()) page.emplace_back(order.Int(0), order.Double(1));
-  Statement snippet(db, std::string("SELECT ") + kHitColumns +
-                            ", snippet(words, -1, '[', ']', '...', 12)" + from +
-                            " AND words MATCH ?1 AND words.rowid = ?2");
-  for (const auto& [id, rank] : page) {
-    snippet.Bind(1, f.text_args.front()).Bind(2, id);
-    if (snippet.Step()) {
-      result.hits.push_back(ReadHit(snippet));
-      result.hits.back().snippet = snippet.Text(kHitColumnCount);
-      result.hits.back().rank = rank;
-    }
-    snippet.Reset();
-  }
+  result.hits = Snippets(db, f.text_args.front(), page);
   return result;
 }
 

@@ -420,6 +420,11 @@ TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
       {"cafe", {"/v/s/b.txt"}},  // diacritics removed
       {"NEAR(fox dog)", {}},     // user text is never FTS5 syntax
       {"guide", {"/v/s/c.txt"}},
+      {"fox OR guide", {"/v/s/a.txt", "/v/s/c.txt"}},
+      {"dog fox OR anger", {"/v/s/a.txt", "/v/s/b.txt"}},
+      {"quick* -fox", {"/v/s/b.txt", "/v/s/c.txt"}},
+      {"brown -\"lazy dog\" -nothing", {"/v/s/b.txt"}},
+      {"OR guide", {}},  // a leading OR is a word to find
   };
   for (const auto& c_ : cases) {
     Json::Value q;
@@ -427,10 +432,12 @@ TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
     const Json::Value answer = SearchFor(q);
     EXPECT_EQ(c_.paths, HitPaths(answer)) << c_.query;
   }
-  Json::Value q;
-  q["text"] = "lazy";
-  EXPECT_EQ("The quick brown fox jumps over the [lazy] dog",
-            SearchFor(q)["data"]["hits"][0]["snippet"].asString());
+  for (const char* lazy : {"lazy", "laz*"}) {
+    Json::Value q;
+    q["text"] = lazy;
+    EXPECT_EQ("The quick brown fox jumps over the [lazy] dog",
+              SearchFor(q)["data"]["hits"][0]["snippet"].asString());
+  }
 }
 
 TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
@@ -504,6 +511,8 @@ TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
       {"limit beyond 64 bits", search("limit", Json::UInt64(~0ull)), search::kBadArgument},
       {"offset beyond the reach", search("offset", 10000), search::kBadArgument},
       {"text of 10,000 words", search("text", many_words), search::kBadArgument},
+      {"text of excluded words only", search("text", "-quick -\"brown fox\""),
+       search::kBadArgument},
       {"name longer than a file name", search("name", std::string(2000, 'n')),
        search::kBadArgument},
       {"database outside a share", create_at(root_.Join("outside/db")), search::kBadArgument},
