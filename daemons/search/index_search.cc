@@ -22,6 +22,7 @@
 #include "search/case_fold.h"
 #include "search/index_store.h"
 #include "search/search_error.h"
+#include "search/text_rank.h"
 
 namespace orvex {
 namespace search {
@@ -45,6 +46,9 @@ constexpr int64_t kSampleStretch = 250;
 // than the page asks): bm25 over every document holding a common word would
 // cost a pass over all of them.
 constexpr int64_t kRankedSet = 2000;
+// A phrase's documents are counted this far for its weight in the ranking,
+// and estimated beyond.
+constexpr int64_t kPhraseCountBound = 2000;
 
 constexpr char kHitColumns[] =
     "d.path, d.name, d.type, d.is_dir, d.size, d.mtime, d.ctime, d.crtime, d.owner, "
@@ -100,10 +104,18 @@ TextTerm NextTextTerm(const std::string& query, size_t& i) {
   return term;
 }
 
+// A text query as FTS5 takes it: the expression, and its phrases in the
+// order FTS5 numbers them, the excluded ones last.
+struct TextExpression {
+  std::string match;
+  std::vector<std::string> phrases;
+  size_t excluded = 0;  // how many phrases at the end are excluded
+};
+
 // The user's query as an FTS5 expression: terms are ANDed, "a OR b" is
 // either, and excluded terms are taken out of the rest. ("cat OR dog food
 // -fish" is ((cat OR dog) AND food) NOT fish.)
-std::string TextMatch(const std::string& query) {
+TextExpression TextMatch(const std::string& query) {
   std::vector<std::vector<std::string>> all_of;  // each holds its alternatives
   std::vector<std::string> excluded;
   bool or_next = false;
@@ -128,15 +140,22 @@ std::string TextMatch(const std::string& query) {
     if (!term.is_or) or_next = false;
   }
   if (all_of.empty()) throw SearchError(kBadArgument, "the text query has no words to find");
-  std::string match;
+  TextExpression e;
   for (const std::vector<std::string>& either : all_of) {
     std::string group;
-    for (const std::string& term : either) group += (group.empty() ? "" : " OR ") + term;
+    for (const std::string& term : either) {
+      group += (group.empty() ? "" : " OR ") + term;
+      e.phrases.push_back(term);
+    }
     if (either.size() > 1) group = "(" + group + ")";
-    match += (match.empty() ? "" : " AND ") + group;
+    e.match += (e.match.empty() ? "" : " AND ") + group;
   }
-  for (const std::string& term : excluded) match = "(" + match + ") NOT " + term;
-  return match;
+  for (const std::string& term : excluded) {
+    e.match = "(" + e.match + ") NOT " + term;
+    e.phrases.push_back(term);
+  }
+  e.excluded = excluded.size();
+  return e;
 }
 
 // Ties go by path in the same direction, so that a descending name order is
@@ -156,6 +175,7 @@ struct Filter {
   std::string where;
   std::vector<std::string> text_args;  // bound first, as text
   std::vector<int64_t> int_args;       // bound after the text arguments
+  TextExpression text;                 // of the "text" query, when there is one
 };
 
 Filter BuildFilter(const SearchQuery& q, const std::string& folded_name) {
@@ -164,7 +184,10 @@ Filter BuildFilter(const SearchQuery& q, const std::string& folded_name) {
     f.where += " AND " + clause;
     f.text_args.push_back(arg);
   };
-  if (!q.text.empty()) text("words MATCH ?", TextMatch(q.text));
+  if (!q.text.empty()) {
+    f.text = TextMatch(q.text);
+    text("words MATCH ?", f.text.match);
+  }
   if (!folded_name.empty()) {
     // With other filters a short fragment scans: a prefix query for one
     // common letter would first gather every name holding it.
@@ -370,22 +393,11 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
   return result;
 }
 
-// Whether an FTS5 expression of TextMatch holds a prefix term ("word"*). A
-// phrase that begins with "* " looks like one too, which only costs it the
-// single pass below.
-bool HasPrefixTerm(const std::string& match) {
-  for (size_t p = match.find("\"*"); p != std::string::npos; p = match.find("\"*", p + 1)) {
-    const size_t after = p + 2;
-    if (after == match.size() || match[after] == ' ' || match[after] == ')') return true;
-  }
-  return false;
-}
-
 // The page's hits, each with its snippet, in the page's order. FTS5 finds
 // one document of a query by its rowid cheaply, except for a prefix term,
 // whose matching words it gathers afresh each time the query starts: then
 // one pass over the matches makes every snippet of the page.
-std::vector<SearchHit> Snippets(SqliteDb& db, const std::string& match,
+std::vector<SearchHit> Snippets(SqliteDb& db, const TextExpression& text,
                                 const std::vector<std::pair<int64_t, double>>& page) {
   if (page.empty()) return {};
   const std::string select = std::string("SELECT ") + kHitColumns +
@@ -397,18 +409,20 @@ std::vector<SearchHit> Snippets(SqliteDb& db, const std::string& match,
     hit.snippet = s.Text(kHitColumnCount);
     found.emplace(s.Int(kHitColumnCount + 1), std::move(hit));
   };
-  if (HasPrefixTerm(match)) {
+  const bool prefix = std::any_of(text.phrases.begin(), text.phrases.end(),
+                                  [](const std::string& p) { return p.back() == '*'; });
+  if (prefix) {
     std::string ids;
     for (const auto& entry : page) ids += (ids.empty() ? "" : ",") + std::to_string(entry.first);
     // The unary + keeps the rowids from FTS5, which would seek (and gather)
     // once per id.
     Statement all(db, select + " AND +words.rowid IN (" + ids + ")");
-    all.Bind(1, match);
+    all.Bind(1, text.match);
     while (all.Step()) take(all);
   } else {
     Statement one(db, select + " AND words.rowid = ?2");
     for (const auto& entry : page) {
-      one.Bind(1, match).Bind(2, entry.first);
+      one.Bind(1, text.match).Bind(2, entry.first);
       if (one.Step()) take(one);
       one.Reset();
     }
@@ -423,6 +437,36 @@ std::vector<SearchHit> Snippets(SqliteDb& db, const std::string& match,
   return hits;
 }
 
+// How many text documents hold phrase: counted up to kPhraseCountBound,
+// and beyond it estimated from how far into the ids that count was reached
+// (text documents come in the order their folders are walked, which spreads
+// a common phrase about evenly over the ids).
+double DocumentsHolding(SqliteDb& db, const std::string& phrase) {
+  Statement count(db,
+                  "SELECT count(*), max(rowid), (SELECT min(id) FROM contents), "
+                  "(SELECT max(id) FROM contents) FROM "
+                  "(SELECT rowid FROM words WHERE words MATCH ?1 LIMIT ?2)");
+  count.Bind(1, phrase).Bind(2, kPhraseCountBound);
+  if (!count.Step()) return 0;
+  const auto holding = static_cast<double>(count.Int(0));
+  if (count.Int(0) < kPhraseCountBound) return holding;
+  const int64_t first = count.Int(2);
+  const auto reached = static_cast<double>(count.Int(1) - first + 1);
+  return holding * static_cast<double>(count.Int(3) - first + 1) / reached;
+}
+
+// The relevance of each match (see text_rank.h), with each phrase's share
+// of the documents estimated cheaply.
+std::string RankOf(SqliteDb& db, const TextExpression& e) {
+  std::string rank = std::string(kTextRank) + "(words";
+  const size_t wanted = e.phrases.size() - e.excluded;
+  for (size_t p = 0; p < e.phrases.size(); ++p) {
+    rank += ", " + (p < wanted ? std::to_string(std::llround(DocumentsHolding(db, e.phrases[p])))
+                               : std::string("-1"));
+  }
+  return rank + ")";
+}
+
 // Words: the page's ids by the query's order first, then a snippet for
 // each of them alone.
 SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
@@ -433,17 +477,17 @@ SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
   result.total = CountUpTo(db, from + f.where, f, bound);
   result.exact = result.total < bound;
   const std::string dir = q.descending ? " DESC" : "";
-  Statement order(
-      db, q.sort == "relevance"
-              ? "SELECT id, r FROM (SELECT d.id AS id, d.path AS path, words.rank AS r" + from +
-                    f.where + " LIMIT ?) ORDER BY r" + dir + ", path" + dir + " LIMIT ?"
-              : "SELECT d.id, 0" + from + f.where + OrderBy(q, true) + " LIMIT ?");
+  Statement order(db, q.sort == "relevance"
+                          ? "SELECT id, r FROM (SELECT d.id AS id, d.path AS path, " +
+                                RankOf(db, f.text) + " AS r" + from + f.where +
+                                " LIMIT ?) ORDER BY r" + dir + ", path" + dir + " LIMIT ?"
+                          : "SELECT d.id, 0" + from + f.where + OrderBy(q, true) + " LIMIT ?");
   int next = Bind(order, f);
   if (q.sort == "relevance") order.Bind(next++, std::max(kRankedSet, need));
   order.Bind(next, need);
   std::vector<std::pair<int64_t, double>> page;
   while (order.Step()) page.emplace_back(order.Int(0), order.Double(1));
-  result.hits = Snippets(db, f.text_args.front(), page);
+  result.hits = Snippets(db, f.text, page);
   return result;
 }
 

@@ -12,6 +12,7 @@
 #include "search/json_text.h"
 #include "search/name_tokenizer.h"
 #include "search/search_error.h"
+#include "search/text_rank.h"
 
 namespace orvex {
 namespace search {
@@ -312,6 +313,7 @@ IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
   CreateSchema(*writer_);
   reader_ = std::make_unique<SqliteDb>(path, /*create=*/false);
   RegisterNameTokenizer(reader_->handle());
+  RegisterTextRank(reader_->handle());
   reader_->Exec("PRAGMA busy_timeout=5000");
   st_ = std::make_unique<Statements>(*writer_);
   LoadMappings();

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "search/search_error.h"
+#include "search/sqlite_db.h"
 
 namespace orvex {
 namespace search {
@@ -52,17 +53,6 @@ int Tokenize(Fts5Tokenizer*, void* context, int flags, const char* text, int siz
     if (const int rc = emit(i, std::min(i + kGram, count)); rc != SQLITE_OK) return rc;
   }
   return SQLITE_OK;
-}
-
-fts5_api* Fts5Api(sqlite3* db) {
-  fts5_api* api = nullptr;
-  sqlite3_stmt* stmt = nullptr;
-  if (sqlite3_prepare_v2(db, "SELECT fts5(?1)", -1, &stmt, nullptr) == SQLITE_OK) {
-    sqlite3_bind_pointer(stmt, 1, &api, "fts5_api_ptr", nullptr);
-    sqlite3_step(stmt);
-  }
-  sqlite3_finalize(stmt);
-  return api;
 }
 
 }  // namespace

@@ -110,5 +110,16 @@ std::string_view Statement::TextView(int column) const {
   return std::string_view(text, static_cast<size_t>(sqlite3_column_bytes(stmt_.get(), column)));
 }
 
+fts5_api* Fts5Api(sqlite3* db) {
+  fts5_api* api = nullptr;
+  sqlite3_stmt* stmt = nullptr;
+  if (sqlite3_prepare_v2(db, "SELECT fts5(?1)", -1, &stmt, nullptr) == SQLITE_OK) {
+    sqlite3_bind_pointer(stmt, 1, &api, "fts5_api_ptr", nullptr);
+    sqlite3_step(stmt);
+  }
+  sqlite3_finalize(stmt);
+  return api;
+}
+
 }  // namespace search
 }  // namespace orvex

@@ -78,6 +78,10 @@ class SqliteDb {
   sqlite3* db_ = nullptr;
 };
 
+// The connection's FTS5 interface, for registering tokenizers and
+// functions; null when SQLite was built without FTS5.
+fts5_api* Fts5Api(sqlite3* db);
+
 }  // namespace search
 }  // namespace orvex
 

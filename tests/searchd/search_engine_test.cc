@@ -440,6 +440,47 @@ TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
   }
 }
 
+// Below the bound where phrases' documents are counted, the relevance order
+// is FTS5's own bm25 order (ties by path), for words, phrases, prefixes,
+// either-or and excluded terms.
+TEST_F(SearchEngineTest, RelevanceOrderIsBm25) {
+  const char* const vocabulary[] = {"alpha", "beta", "gamma", "delta", "epsilon", "zeta"};
+  std::mt19937 random(11);
+  for (int i = 0; i < 60; ++i) {
+    std::string text;
+    const int words = 3 + static_cast<int>(random() % 30);
+    for (int w = 0; w < words; ++w) text += std::string(vocabulary[random() % 6]) + " ";
+    Json::Value doc = FileDoc("/v/s/t" + std::to_string(100 + i) + ".txt");
+    doc["KALOMDTextContent"] = text;
+    Ok(Upsert(kId, doc));
+  }
+  Commit();
+  search::SqliteDb db(DbPath(), /*create=*/false);
+  const struct {
+    const char* query;  // ours
+    const char* fts5;   // the same for FTS5
+  } cases[] = {
+      {"zeta", "zeta"},
+      {"alpha zeta", "alpha AND zeta"},
+      {"\"beta gamma\" delta", "\"beta gamma\" AND delta"},
+      {"eps* OR zeta -alpha", "(eps* OR zeta) NOT alpha"},
+  };
+  for (const auto& c : cases) {
+    search::Statement bm25(db,
+                           "SELECT d.path FROM words JOIN documents d ON d.id = words.rowid "
+                           "WHERE words MATCH ?1 ORDER BY bm25(words), d.path");
+    bm25.Bind(1, c.fts5);
+    std::vector<std::string> expected;
+    while (bm25.Step()) expected.push_back(bm25.Text(0));
+    Json::Value q;
+    q["text"] = c.query;
+    q["sort"] = "relevance";
+    q["limit"] = 100;
+    EXPECT_FALSE(expected.empty()) << c.query;
+    EXPECT_EQ(expected, HitPaths(SearchFor(q))) << c.query;
+  }
+}
+
 TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
   Json::Value no_doc_id = Command("document_upsert_by_id", kId);
   no_doc_id["data"]["data"] = FileDoc("/v/s/x");
