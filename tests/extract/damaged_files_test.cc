@@ -10,7 +10,6 @@
 #include <vector>
 
 #include "extract/test_files.h"
-#include "support/temp_dir.h"
 
 namespace orvex {
 namespace extract {
@@ -18,7 +17,7 @@ namespace {
 
 using testing::Extract;
 
-class DamagedFilesTest : public ::testing::Test {
+class DamagedFilesTest : public testing::ExtractTest {
  protected:
   // The bytes of a sound file of type ext, which the extractor reads
   // without a problem.
@@ -64,8 +63,6 @@ class DamagedFilesTest : public ::testing::Test {
     std::ifstream in(path, std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
   }
-
-  orvex::testing::TempDir dir_;
 };
 
 const std::vector<std::string> kSoundTypes = {"pdf", "docx", "odt", "epub", "html", "mp3",

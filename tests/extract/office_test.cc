@@ -7,13 +7,13 @@
 #include <vector>
 
 #include "extract/test_files.h"
-#include "support/temp_dir.h"
 #include "zip_reader.h"
 
 namespace orvex {
 namespace extract {
 namespace {
 
+using testing::ExpectMembers;
 using testing::Extract;
 using testing::WriteZip;
 using testing::ZipEntry;
@@ -49,20 +49,7 @@ const char kAppProperties[] =
     "xmlns=\"http://schemas.openxmlformats.org/officeDocument/2006/extended-properties\">"
     "<Application>Microsoft Office Word</Application><Pages>1</Pages></Properties>";
 
-class OfficeTest : public ::testing::Test {
- protected:
-  void ExpectCoreProperties(const Json::Value& out) {
-    EXPECT_EQ("Budget 2024", out["KALOMDTitle"].asString());
-    EXPECT_EQ("Grace Hopper", out["KALOMDAuthors"].asString());
-    EXPECT_EQ("The yearly budget", out["KALOMDDescription"].asString());
-    EXPECT_EQ("budget, plan", out["KALOMDKeywords"].asString());
-    EXPECT_EQ(1651820889, out["KALOMDContentCreationDate"].asInt64());
-    EXPECT_EQ(1709288430, out["KALOMDContentModificationDate"].asInt64());
-    EXPECT_EQ("Microsoft Office Word", out["KALOMDCreator"].asString());
-  }
-
-  orvex::testing::TempDir dir_;
-};
+using OfficeTest = testing::ExtractTest;
 
 TEST_F(OfficeTest, WordDocumentGivesCorePropertiesAndText) {
   const std::string path = dir_.Join("budget.docx");
@@ -80,7 +67,10 @@ TEST_F(OfficeTest, WordDocumentGivesCorePropertiesAndText) {
                   {"docProps/app.xml", kAppProperties}});
   const auto result = Extract(path);
   ASSERT_TRUE(result.ok) << result.problem;
-  ExpectCoreProperties(result.out);
+  ExpectMembers(result.out, R"({"KALOMDTitle": "Budget 2024", "KALOMDAuthors": "Grace Hopper",
+      "KALOMDDescription": "The yearly budget", "KALOMDKeywords": "budget, plan",
+      "KALOMDContentCreationDate": 1651820889, "KALOMDContentModificationDate": 1709288430,
+      "KALOMDCreator": "Microsoft Office Word"})");
   EXPECT_EQ("Hello\nSplit\tword & caf\xC3\xA9\nline\nA note",
             result.out["KALOMDTextContent"].asString());
 }
@@ -150,16 +140,11 @@ TEST_F(OfficeTest, OpenDocumentGivesMetaAndText) {
              "<dc:date>2024-03-01T10:20:30.5</dc:date></office:meta></office:document-meta>"}});
   const auto result = Extract(path);
   ASSERT_TRUE(result.ok) << result.problem;
-  const Json::Value& out = result.out;
-  EXPECT_EQ("A letter", out["KALOMDTitle"].asString());
-  EXPECT_EQ("Ada Lovelace", out["KALOMDAuthors"].asString());
-  EXPECT_EQ("To a friend", out["KALOMDDescription"].asString());
-  EXPECT_EQ("letter, friend", out["KALOMDKeywords"].asString());
-  EXPECT_EQ("LibreOffice/7.4", out["KALOMDCreator"].asString());
-  EXPECT_EQ(1640908800, out["KALOMDContentCreationDate"].asInt64());
-  EXPECT_EQ(1709288430, out["KALOMDContentModificationDate"].asInt64());
-  EXPECT_EQ("Dear reader\nTwo spaces and a\ttab.\nLine\nbreak in a span",
-            out["KALOMDTextContent"].asString());
+  ExpectMembers(result.out, R"({"KALOMDTitle": "A letter", "KALOMDAuthors": "Ada Lovelace",
+      "KALOMDDescription": "To a friend", "KALOMDKeywords": "letter, friend",
+      "KALOMDCreator": "LibreOffice/7.4", "KALOMDContentCreationDate": 1640908800,
+      "KALOMDContentModificationDate": 1709288430,
+      "KALOMDTextContent": "Dear reader\nTwo spaces and a\ttab.\nLine\nbreak in a span"})");
 }
 
 TEST_F(OfficeTest, EpubFollowsTheSpine) {
@@ -193,13 +178,10 @@ TEST_F(OfficeTest, EpubFollowsTheSpine) {
              "</package>"}});
   const auto result = Extract(path);
   ASSERT_TRUE(result.ok) << result.problem;
-  const Json::Value& out = result.out;
-  EXPECT_EQ("The Book", out["KALOMDTitle"].asString());
-  EXPECT_EQ("Ann Author, Bob Writer", out["KALOMDAuthors"].asString());
-  EXPECT_EQ("urn:isbn:9780000000001", out["KALOMDIdentifier"].asString());
-  EXPECT_EQ("fiction", out["KALOMDKeywords"].asString());
-  EXPECT_EQ(1640908800, out["KALOMDContentCreationDate"].asInt64());
-  EXPECT_EQ("Start\nFirst chapter.\nSecond chapter.", out["KALOMDTextContent"].asString());
+  ExpectMembers(result.out, R"({"KALOMDTitle": "The Book",
+      "KALOMDAuthors": "Ann Author, Bob Writer", "KALOMDIdentifier": "urn:isbn:9780000000001",
+      "KALOMDKeywords": "fiction", "KALOMDContentCreationDate": 1640908800,
+      "KALOMDTextContent": "Start\nFirst chapter.\nSecond chapter."})");
 }
 
 TEST_F(OfficeTest, TextCapCutsAtACharacterBoundary) {

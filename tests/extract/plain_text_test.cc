@@ -6,7 +6,6 @@
 #include <vector>
 
 #include "extract/test_files.h"
-#include "support/temp_dir.h"
 
 namespace orvex {
 namespace extract {
@@ -15,10 +14,7 @@ namespace {
 using testing::Encode;
 using testing::Extract;
 
-class PlainTextTest : public ::testing::Test {
- protected:
-  orvex::testing::TempDir dir_;
-};
+using PlainTextTest = testing::ExtractTest;
 
 // Long enough for an encoding guess to be sure of itself.
 const std::string kFrench =

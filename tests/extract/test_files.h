@@ -2,13 +2,14 @@
 // packages written with libarchive, texts re-encoded with the C library's
 // iconv (not the ICU that the extractor uses), a bare JPEG given EXIF by
 // Exiv2, MPEG audio frames, a PCM WAV, an AVI and a FLAC written by FFmpeg's
-// libraries; and a
-// helper that runs ExtractMetadata on one.
+// libraries; the fixture that holds them, a helper that runs ExtractMetadata
+// on one and one that compares the properties it gave.
 #ifndef ORVEX_TESTS_EXTRACT_TEST_FILES_H_
 #define ORVEX_TESTS_EXTRACT_TEST_FILES_H_
 
 #include <archive.h>
 #include <archive_entry.h>
+#include <gtest/gtest.h>
 #include <iconv.h>
 #include <json/json.h>
 
@@ -23,12 +24,14 @@ extern "C" {
 #include <cstdint>
 #include <cstdio>
 #include <functional>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "content_extractor.h"
+#include "support/temp_dir.h"
 
 namespace orvex {
 namespace extract {
@@ -39,6 +42,32 @@ struct Extraction {
   std::string problem;
   Json::Value out;
 };
+
+// A fresh directory for one test's files.
+class ExtractTest : public ::testing::Test {
+ protected:
+  orvex::testing::TempDir dir_;
+};
+
+// Expects each member of want (a JSON object literal) in out with that value,
+// integers compared by value whatever their JSON type; a null member must be
+// absent.
+inline void ExpectMembers(const Json::Value& out, const std::string& want_text) {
+  Json::Value want;
+  std::istringstream in(want_text);
+  std::string errors;
+  ASSERT_TRUE(Json::parseFromStream(Json::CharReaderBuilder(), in, &want, &errors)) << errors;
+  for (const std::string& name : want.getMemberNames()) {
+    const Json::Value& expected = want[name];
+    if (expected.isNull()) {
+      EXPECT_FALSE(out.isMember(name)) << name;
+    } else if (expected.isIntegral() && out[name].isIntegral()) {
+      EXPECT_EQ(expected.asInt64(), out[name].asInt64()) << name;
+    } else {
+      EXPECT_EQ(expected, out[name]) << name;
+    }
+  }
+}
 
 inline Extraction Extract(const std::string& path, size_t max_text_bytes = 1 << 20) {
   ExtractLimits limits;
