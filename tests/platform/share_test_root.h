@@ -1,6 +1,7 @@
 // ShareTestRoot: a test fixture with its own ORVEX_ROOT and share registry.
 // Shares are registered with real root directories under the temporary
-// directory. One test at a time (it changes the process environment).
+// directory. One test at a time (it changes the process environment). Only
+// jsoncpp besides: the portable platform's tests use it too.
 #ifndef ORVEX_TESTS_PLATFORM_SHARE_TEST_ROOT_H_
 #define ORVEX_TESTS_PLATFORM_SHARE_TEST_ROOT_H_
 
@@ -8,9 +9,10 @@
 #include <json/json.h>
 
 #include <filesystem>
+#include <sstream>
 #include <string>
 
-#include "orvex/foundation/json.h"
+#include "support/run_program.h"
 #include "support/temp_dir.h"
 
 namespace orvex {
@@ -36,7 +38,9 @@ class ShareTestRoot : public ::testing::Test {
     entry["name"] = name;
     entry["path"] = root;
     shares_.append(entry);
-    WriteRegistryText(toString(shares_));
+    Json::StreamWriterBuilder compact;
+    compact["indentation"] = "";
+    WriteRegistryText(Json::writeString(compact, shares_));
   }
 
   void WriteRegistryText(const std::string& text) {
@@ -57,7 +61,9 @@ class ShareTestRoot : public ::testing::Test {
 // Json options from a one-line literal such as R"({"readonly": true})".
 inline Json::Value Options(const std::string& text) {
   Json::Value value;
-  EXPECT_TRUE(fromString(value, text)) << text;
+  std::istringstream in(text);
+  std::string errors;
+  EXPECT_TRUE(Json::parseFromStream(Json::CharReaderBuilder(), in, &value, &errors)) << text;
   return value;
 }
 

@@ -18,13 +18,13 @@
 #include "kalo/kalo_quota.h"
 #include "kalo/kalo_unicode.h"
 #include "kalo/kalo_user.h"
-#include "kalo_test_root.h"
+#include "platform/share_test_root.h"
 
 namespace orvex {
 namespace portable {
 namespace {
 
-using testing::TempRootTest;
+using TempRootTest = testing::ShareTestRoot;
 
 TEST(KaloPathTest, ComposesInsideTheMetadataFolderOfAbsoluteRootsOnly) {
   char buf[4096];
@@ -60,13 +60,13 @@ TEST(KaloUnicodeTest, ComparesByCaseFoldingOrAsBytesWhenInvalid) {
 }
 
 TEST_F(TempRootTest, QuotaComparesAgainstTheFreeSpaceAndTellsWhyNot) {
-  EXPECT_EQ(KALOQuotaIsEnough(0, root_.c_str(), 0, 0), 1);
+  EXPECT_EQ(KALOQuotaIsEnough(0, dir_.path().c_str(), 0, 0), 1);
   struct statvfs vfs;
-  ASSERT_EQ(::statvfs(root_.c_str(), &vfs), 0);
-  EXPECT_EQ(KALOQuotaIsEnough(0, root_.c_str(), vfs.f_blocks * vfs.f_frsize + 1, 0), 0);
+  ASSERT_EQ(::statvfs(dir_.path().c_str(), &vfs), 0);
+  EXPECT_EQ(KALOQuotaIsEnough(0, dir_.path().c_str(), vfs.f_blocks * vfs.f_frsize + 1, 0), 0);
   EXPECT_EQ(KLIBCErrGet(), KLIB_ERR_OUT_OF_SPACE);
   // A check that cannot be made is not a space error.
-  EXPECT_EQ(KALOQuotaIsEnough(0, (root_ + "/missing").c_str(), 1, 0), 0);
+  EXPECT_EQ(KALOQuotaIsEnough(0, dir_.Join("missing").c_str(), 1, 0), 0);
   EXPECT_EQ(KLIBCErrGet(), KLIB_ERR_IO);
 }
 
@@ -112,7 +112,7 @@ class KaloUserTest : public TempRootTest {
 };
 
 TEST_F(KaloUserTest, RootSwitchesToNobodyAndBack) {
-  const std::string secret = root_ + "/secret";
+  const std::string secret = dir_.Join("secret");
   ASSERT_EQ(::mkdir(secret.c_str(), 0750), 0);  // group 0 may list it too
   auto can_list = [&secret] {
     DIR* d = ::opendir(secret.c_str());

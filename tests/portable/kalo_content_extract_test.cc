@@ -99,41 +99,39 @@ TEST_F(ContentExtractTest, DescribesFilesDirectoriesAndLinksAsThemselves) {
        false, "lnk", "0777"},
   };
   for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
     const std::string path = dir_.Join(c.name);
     c.make(path);
     SetModified(path);
     struct stat st;
-    ASSERT_EQ(0, ::lstat(path.c_str(), &st)) << c.name;
+    ASSERT_EQ(0, ::lstat(path.c_str(), &st));
     for (const bool need_meta : {false, true}) {
       Json::Value cfg;
       cfg["need_meta"] = need_meta;
       Json::Value doc;
-      ASSERT_TRUE(ParseFile(path, cfg, doc)) << c.name;
-      EXPECT_EQ(path, doc["KALOMDPath"].asString()) << c.name;
+      ASSERT_TRUE(ParseFile(path, cfg, doc));
+      EXPECT_EQ(path, doc["KALOMDPath"].asString());
       EXPECT_EQ(c.name, doc["KALOMDFSName"].asString());
-      EXPECT_EQ(dir_.path(), doc["KALOMDParent"].asString()) << c.name;
-      EXPECT_EQ(c.extension, doc["KALOMDExtension"].asString()) << c.name;
-      EXPECT_EQ(Json::Value(c.is_dir), doc["KALOMDIsDir"]) << c.name;
-      EXPECT_EQ(Json::Value(static_cast<Json::Int64>(st.st_size)), doc["KALOMDFSSize"]) << c.name;
-      EXPECT_EQ(static_cast<Json::Int64>(st.st_blocks) * 512, doc["KALOMDPhysicalSize"].asInt64())
-          << c.name;
-      EXPECT_EQ(Json::Value(static_cast<Json::Int64>(kModified)), doc["KALOMDFSContentChangeDate"])
-          << c.name;
-      EXPECT_EQ(static_cast<Json::Int64>(st.st_ctime), doc["KALOMDAttributeChangeDate"].asInt64())
-          << c.name;
-      EXPECT_EQ(std::to_string(::geteuid()), doc["KALOMDOwnerUserID"].asString()) << c.name;
-      EXPECT_EQ(std::to_string(st.st_gid), doc["KALOMDOwnerGroupID"].asString()) << c.name;
-      EXPECT_EQ(c.privilege, doc["KALOMDPrivilege"].asString()) << c.name;
+      EXPECT_EQ(dir_.path(), doc["KALOMDParent"].asString());
+      EXPECT_EQ(c.extension, doc["KALOMDExtension"].asString());
+      EXPECT_EQ(Json::Value(c.is_dir), doc["KALOMDIsDir"]);
+      EXPECT_EQ(Json::Value(static_cast<Json::Int64>(st.st_size)), doc["KALOMDFSSize"]);
+      EXPECT_EQ(static_cast<Json::Int64>(st.st_blocks) * 512, doc["KALOMDPhysicalSize"].asInt64());
+      EXPECT_EQ(Json::Value(static_cast<Json::Int64>(kModified)), doc["KALOMDFSContentChangeDate"]);
+      EXPECT_EQ(static_cast<Json::Int64>(st.st_ctime), doc["KALOMDAttributeChangeDate"].asInt64());
+      EXPECT_EQ(std::to_string(::geteuid()), doc["KALOMDOwnerUserID"].asString());
+      EXPECT_EQ(std::to_string(st.st_gid), doc["KALOMDOwnerGroupID"].asString());
+      EXPECT_EQ(c.privilege, doc["KALOMDPrivilege"].asString());
       std::set<std::string> expected_keys = AlwaysGiven();
       // Where the file system records a birth time, it is the creation date:
       // the item was made during this test.
       if (doc.isMember("KALOMDFSCreationDate")) {
         expected_keys.insert("KALOMDFSCreationDate");
-        EXPECT_TRUE(doc["KALOMDFSCreationDate"].isIntegral()) << c.name;
-        EXPECT_GE(doc["KALOMDFSCreationDate"].asInt64(), started_ - 1) << c.name;
-        EXPECT_LE(doc["KALOMDFSCreationDate"].asInt64(), ::time(nullptr) + 1) << c.name;
+        EXPECT_TRUE(doc["KALOMDFSCreationDate"].isIntegral());
+        EXPECT_GE(doc["KALOMDFSCreationDate"].asInt64(), started_ - 1);
+        EXPECT_LE(doc["KALOMDFSCreationDate"].asInt64(), ::time(nullptr) + 1);
       }
-      EXPECT_EQ(expected_keys, Keys(doc)) << c.name;
+      EXPECT_EQ(expected_keys, Keys(doc));
     }
   }
 }

@@ -13,13 +13,13 @@
 
 #include "kalo/kalo_error.h"
 #include "kalo/kalo_smb.h"
-#include "portable/kalo_test_root.h"
+#include "platform/share_test_root.h"
 
 namespace orvex {
 namespace testing {
 namespace {
 
-class KaloServiceTest : public TempRootTest {
+class KaloServiceTest : public ShareTestRoot {
  protected:
   KaloServiceTest() {
     ctl_ = dir_.Write("ctl", "#!/bin/sh\necho \"$#:$1:$2\" >> \"" + dir_.Join("calls") +
@@ -97,7 +97,7 @@ TEST_F(KaloServiceTest, UnderSystemdTheStandInIsNotUsed) {
   EXPECT_TRUE(Calls().empty());
 }
 
-class KaloSmbTest : public TempRootTest {
+class KaloSmbTest : public ShareTestRoot {
  protected:
   std::string SettingsPath() const { return dir_.Join("etc/orvex/smb.json"); }
 };

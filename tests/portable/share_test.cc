@@ -14,9 +14,9 @@
 
 #include "kalo/kalo_error.h"
 #include "kalo/kalo_share.h"
-#include "kalo_test_root.h"
 #include "orvex/portable/atomic_file.h"
 #include "orvex/portable/share_registry.h"
+#include "platform/share_test_root.h"
 
 namespace orvex {
 namespace portable {
@@ -35,9 +35,9 @@ std::vector<std::string> Names() {
   return names;
 }
 
-class ShareRegistryTest : public testing::TempRootTest {
+class ShareRegistryTest : public testing::ShareTestRoot {
  protected:
-  const std::string registry_ = root_ + "/etc/orvex/shares.json";
+  const std::string registry_ = dir_.Join("etc/orvex/shares.json");
 };
 
 TEST_F(ShareRegistryTest, AddUpdateRemoveRoundTripOnExactNamesKeepingTheOrder) {
@@ -46,10 +46,10 @@ TEST_F(ShareRegistryTest, AddUpdateRemoveRoundTripOnExactNamesKeepingTheOrder) {
   photo.readonly = photo.hide_unreadable = true;
   photo.ftp_privilege = 7;
   photo.privileges = {{"alice", "rw"}, {"bob", "ro"}, {"eve", "na"}};
-  AddShare(Share("ph", "/srv/ph"));
-  AddShare(photo);
-  AddShare(Share("Photo", "/srv/Photo"));
-  EXPECT_THROW(AddShare(Share("photo", "/srv/other")), std::invalid_argument);
+  portable::AddShare(Share("ph", "/srv/ph"));
+  portable::AddShare(photo);
+  portable::AddShare(Share("Photo", "/srv/Photo"));
+  EXPECT_THROW(portable::AddShare(Share("photo", "/srv/other")), std::invalid_argument);
   ShareRecord read;
   ASSERT_TRUE(FindShare("photo", read));
   EXPECT_EQ(read.path, "/srv/данные/photo") << "trailing slash dropped";
@@ -78,7 +78,7 @@ TEST_F(ShareRegistryTest, MalformedRegistryNamesTheFileAndTheProblem) {
        "share [1]: duplicate name \"a\""},
   };
   for (const auto& [text, problem] : cases) {
-    WriteRegistry(text);
+    WriteRegistryText(text);
     try {
       LoadShares();
       ADD_FAILURE() << "accepted: " << text;
@@ -89,7 +89,7 @@ TEST_F(ShareRegistryTest, MalformedRegistryNamesTheFileAndTheProblem) {
     }
   }
   // Adding to a malformed registry leaves it as it was.
-  EXPECT_THROW(AddShare(Share("b", "/b")), std::runtime_error);
+  EXPECT_THROW(portable::AddShare(Share("b", "/b")), std::runtime_error);
   EXPECT_EQ(testing::ReadFileText(registry_), cases.back().first);
 }
 
@@ -112,36 +112,37 @@ TEST_F(ShareRegistryTest, AddRefusesBadRecordsAndWritesNothing) {
   };
   for (const auto& [share, problem] : cases) {
     try {
-      AddShare(share);
+      portable::AddShare(share);
       ADD_FAILURE() << "accepted [" << share.name << "] [" << share.path << "]";
     } catch (const std::invalid_argument& e) {
       EXPECT_NE(std::string(e.what()).find(problem), std::string::npos) << e.what();
     }
   }
-  AddShare(Share("写真 Ärger", "/srv/photo"));  // UTF-8 names are fine
+  portable::AddShare(Share("写真 Ärger", "/srv/photo"));  // UTF-8 names are fine
   EXPECT_EQ(Names(), std::vector<std::string>{"写真 Ärger"});
 }
 
 TEST_F(ShareRegistryTest, AddCheckSeesTheRegistryAndTheStoredRecordAndMayRefuse) {
-  AddShare(Share("a", "/srv/a"));
+  portable::AddShare(Share("a", "/srv/a"));
   std::vector<std::string> seen;
   auto refuse = [&seen](const std::vector<ShareRecord>& shares, const ShareRecord& share) {
     for (const ShareRecord& other : shares) seen.push_back(other.name);
     seen.push_back(share.path);
     throw std::logic_error("refused");
   };
-  EXPECT_THROW(AddShare(Share("b", "/srv/b//"), refuse), std::logic_error);
+  EXPECT_THROW(portable::AddShare(Share("b", "/srv/b//"), refuse), std::logic_error);
   EXPECT_EQ(seen, (std::vector<std::string>{"a", "/srv/b"}));
   EXPECT_EQ(Names(), std::vector<std::string>{"a"}) << "a refused share must not be written";
-  AddShare(Share("b", "/srv/b"), [](const std::vector<ShareRecord>&, const ShareRecord&) {});
+  portable::AddShare(Share("b", "/srv/b"),
+                     [](const std::vector<ShareRecord>&, const ShareRecord&) {});
   EXPECT_EQ(Names(), (std::vector<std::string>{"a", "b"}));
 }
 
 // A link or a directory in the registry's place is reported as what it is:
 // never read as "no shares", never replaced by the next add.
 TEST_F(ShareRegistryTest, ALinkOrDirectoryInTheRegistrysPlaceIsReportedAndKept) {
-  WriteRegistry("[]");
-  const std::string real = root_ + "/etc/orvex/real.json";
+  WriteRegistryText("[]");
+  const std::string real = dir_.Join("etc/orvex/real.json");
   std::filesystem::rename(registry_, real);
   const struct {
     const char* what;
@@ -151,8 +152,8 @@ TEST_F(ShareRegistryTest, ALinkOrDirectoryInTheRegistrysPlaceIsReportedAndKept) 
   } cases[] = {
       {"link to a good registry", [&] { std::filesystem::create_symlink(real, registry_); }, ELOOP,
        registry_ + " is a symbolic link"},
-      {"dangling link", [&] { std::filesystem::create_symlink(root_ + "/gone", registry_); }, ELOOP,
-       registry_ + " is a symbolic link"},
+      {"dangling link", [&] { std::filesystem::create_symlink(dir_.Join("gone"), registry_); },
+       ELOOP, registry_ + " is a symbolic link"},
       {"directory", [&] { std::filesystem::create_directory(registry_); }, EISDIR,
        registry_ + " is a directory"},
   };
@@ -161,7 +162,7 @@ TEST_F(ShareRegistryTest, ALinkOrDirectoryInTheRegistrysPlaceIsReportedAndKept) 
     std::filesystem::remove(registry_);
     c.make();
     for (const auto& call : std::vector<std::function<void()>>{
-             [] { LoadShares(); }, [] { AddShare(Share("a", "/srv/a")); }}) {
+             [] { LoadShares(); }, [] { portable::AddShare(Share("a", "/srv/a")); }}) {
       try {
         call();
         ADD_FAILURE() << "no error";
@@ -180,7 +181,7 @@ TEST_F(ShareRegistryTest, ALinkOrDirectoryInTheRegistrysPlaceIsReportedAndKept) 
 // Every state and registry file is saved this way: a link or a directory in
 // the target's place fails before anything is written.
 TEST_F(ShareRegistryTest, AtomicWriteRefusesALinkOrADirectoryAndLeavesNothingBehind) {
-  const std::string dir = root_ + "/state";
+  const std::string dir = dir_.Join("state");
   std::filesystem::create_directories(dir + "/sub");
   testing::TempDir outside;
   std::filesystem::create_symlink(outside.Join("target"), dir + "/link");
@@ -207,7 +208,7 @@ TEST_F(ShareRegistryTest, ConcurrentAddsFromProcessesAllLand) {
       for (int i = 0; i < 6; ++i) {
         const std::string name = "s" + std::to_string(p) + "_" + std::to_string(i);
         try {
-          AddShare(Share(name, "/srv/" + name));
+          portable::AddShare(Share(name, "/srv/" + name));
         } catch (...) {
           ++failures;
         }
@@ -224,14 +225,14 @@ TEST_F(ShareRegistryTest, ConcurrentAddsFromProcessesAllLand) {
   EXPECT_EQ(Names().size(), 48u);
 }
 
-using KaloShareTest = testing::TempRootTest;
+using KaloShareTest = testing::ShareTestRoot;
 
 TEST_F(KaloShareTest, ReadsFlagsAndFailsWithDistinctErrors) {
   PKALOSHARE share = reinterpret_cast<PKALOSHARE>(0x1);
   EXPECT_LT(KALOShareGet("photo", &share), 0) << "no registry: no shares";
   EXPECT_EQ(share, nullptr);
   EXPECT_EQ(KLIBCErrGet(), KLIB_ERR_NO_SUCH_SHARE);
-  WriteRegistry(R"([{"name": "enc", "path": "/v/e/", "encryption": true},
+  WriteRegistryText(R"([{"name": "enc", "path": "/v/e/", "encryption": true},
                     {"name": "gone", "path": "/nonexistent/orvex/gone", "recycle_bin": true}])");
   ASSERT_EQ(KALOShareGet("enc", &share), 0);
   EXPECT_STREQ(share->szPath, "/v/e");
@@ -244,7 +245,7 @@ TEST_F(KaloShareTest, ReadsFlagsAndFailsWithDistinctErrors) {
   EXPECT_LT(KALOShareUserPrivGet("nobody", share), 0);  // the root directory is missing
   EXPECT_EQ(KLIBCErrGet(), KLIB_ERR_IO);
   KALOShareFree(share);
-  WriteRegistry(R"([{"name": "photo", "path": "/v/photo"},])");
+  WriteRegistryText(R"([{"name": "photo", "path": "/v/photo"},])");
   EXPECT_LT(KALOShareGet("photo", &share), 0);
   EXPECT_EQ(KLIBCErrGet(), KLIB_ERR_SHARE_REGISTRY);
 }
@@ -254,18 +255,18 @@ TEST_F(KaloShareTest, ListedPrivilegesWinOverTheDirectoryMode) {
   const std::vector<std::tuple<uid_t, mode_t, int>> cases = {{0, 0755, KALO_SHARE_PRIV_RO},
                                                              {0, 0774, KALO_SHARE_PRIV_NA},
                                                              {65534, 0077, KALO_SHARE_PRIV_NA}};
-  ShareRecord team = Share("team", root_);
+  ShareRecord team = Share("team", dir_.path());
   team.privileges = {{"nobody", "rw"}, {"ghost", "ro"}};
-  AddShare(team);
-  AddShare(Share("plain", root_));
+  portable::AddShare(team);
+  portable::AddShare(Share("plain", dir_.path()));
   PKALOSHARE share = nullptr;
   ASSERT_EQ(KALOShareGet("team", &share), 0);
   EXPECT_EQ(KALOShareUserPrivGet("nobody", share), KALO_SHARE_PRIV_RW);
   EXPECT_EQ(KALOShareUserPrivGet("ghost", share), KALO_SHARE_PRIV_RO) << "needs no system user";
   KALOShareFree(share);
   for (const auto& [owner, mode, nobody] : cases) {
-    ASSERT_EQ(::chown(root_.c_str(), owner, 0), 0);
-    ASSERT_EQ(::chmod(root_.c_str(), mode), 0);
+    ASSERT_EQ(::chown(dir_.path().c_str(), owner, 0), 0);
+    ASSERT_EQ(::chmod(dir_.path().c_str(), mode), 0);
     ASSERT_EQ(KALOShareGet("plain", &share), 0);
     EXPECT_EQ(KALOShareUserPrivGet("nobody", share), nobody) << mode;
     EXPECT_EQ(KALOShareUserPrivGet("root", share), KALO_SHARE_PRIV_RW) << mode;
