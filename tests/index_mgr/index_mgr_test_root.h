@@ -72,6 +72,13 @@ struct Snapshot {
   std::map<std::string, std::vector<std::string>> queues;
 };
 
+// The service control calls of switching the services on or off with the
+// spotlight setting changing too.
+inline const std::vector<std::string> kServicesOn = {"restart samba", "start kalocontentextractd",
+                                                     "start pkg-Orvex-fileindexd"};
+inline const std::vector<std::string> kServicesOff = {"restart samba", "stop kalocontentextractd",
+                                                      "stop pkg-Orvex-fileindexd"};
+
 // One daemon request: "elastic <command> <data.id>" or
 // "fileindexd <type> <data>", with the places as they stood.
 struct Step {
@@ -145,6 +152,7 @@ class IndexMgrTestRoot : public ShareTestRoot {
   }
   std::string ServicesLogPath() const { return dir_.Join("services.log"); }
   std::vector<std::string> Services() const { return SplitLines(ReadFileText(ServicesLogPath())); }
+  void ForgetServices() const { std::filesystem::remove(ServicesLogPath()); }
   void FailServices(int status) const { dir_.Write("servicectl.status", std::to_string(status)); }
 
   std::string QueuePath(const std::string& share) const {
@@ -167,6 +175,23 @@ class IndexMgrTestRoot : public ShareTestRoot {
     }
     return events;
   }
+
+  // Each configuration-change line of the share's queue: its event, path and
+  // four flags ("131072 /v/s/a DA-P").
+  std::vector<std::string> CfgEvents(const std::string& share) const {
+    std::vector<std::string> events;
+    for (const Json::Value& event : QueueEvents(share)) {
+      const Json::Value& d = event["data"];
+      events.push_back(std::to_string(event["event"].asInt()) + " " + event["path"].asString() +
+                       " " + (d["document"].asBool() ? "D" : "-") +
+                       (d["audio"].asBool() ? "A" : "-") + (d["video"].asBool() ? "V" : "-") +
+                       (d["photo"].asBool() ? "P" : "-"));
+    }
+    return events;
+  }
+
+  // How many captured log lines hold text.
+  size_t Logged(const std::string& text) const { return log_.Matching(text).size(); }
 
   // The full paths registered for the share's queue; empty when none.
   std::vector<std::string> Registered(const std::string& share) const {

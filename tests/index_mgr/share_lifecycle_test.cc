@@ -44,13 +44,11 @@ TEST_F(ShareLifecycleTest, ARegistrationThatCannotBeWrittenFailsWith502) {
   const testing::Outcome del = OutcomeOf([] { DeleteShareWorker("s1"); });
   EXPECT_EQ(del.code, kErrorSystem);
   EXPECT_EQ(del.reason, "MonitorQueue::Delete failed, share=s1");
-  EXPECT_EQ(log_.Matching("Failed [!MonitorQueue::Upsert(monitor_queue, kAppName, "
-                          "MONITOR_QUEUE_TYPE_APPLICATION)]")
-                .size(),
+  EXPECT_EQ(Logged("Failed [!MonitorQueue::Upsert(monitor_queue, kAppName, "
+                   "MONITOR_QUEUE_TYPE_APPLICATION)]"),
             1u);
-  EXPECT_EQ(log_.Matching("Failed [!MonitorQueue::Delete(share.GetQueuePath(), kAppName, "
-                          "MONITOR_QUEUE_TYPE_APPLICATION)]")
-                .size(),
+  EXPECT_EQ(Logged("Failed [!MonitorQueue::Delete(share.GetQueuePath(), kAppName, "
+                   "MONITOR_QUEUE_TYPE_APPLICATION)]"),
             1u);
 }
 
