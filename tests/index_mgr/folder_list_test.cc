@@ -35,14 +35,16 @@ Json::Value NaiveList(unsigned offset, unsigned limit, const std::string& sort_b
   return out;
 }
 
-// Log lines with their source line numbers taken out: the same check
-// written in two places logs the same text from different lines.
-std::vector<std::string> WithoutLineNumbers(const std::vector<std::string>& lines) {
-  std::vector<std::string> out;
-  for (const std::string& line : lines) {
-    out.push_back(std::regex_replace(line, std::regex("^([a-z_]+):[0-9]+ "), "$1:N "));
+// What list threw, with its log lines (source line numbers taken out: the
+// same check written in two places logs the same text from different lines).
+testing::Outcome ListAndLog(const std::function<void()>& list, std::vector<std::string>* logged) {
+  testing::LogCapture log;
+  errno = 0;
+  const testing::Outcome outcome = OutcomeOf(list);
+  for (const std::string& line : log.lines()) {
+    logged->push_back(std::regex_replace(line, std::regex("^([a-z_]+):[0-9]+ "), "$1:N "));
   }
-  return out;
+  return outcome;
 }
 
 std::string Line(int event, const std::string& path, const std::string& path_old = "") {
@@ -83,56 +85,42 @@ class FolderListTest : public testing::IndexMgrTestRoot {
 };
 
 TEST_F(FolderListTest, StatusesMatchEachFolderAskedOnItsOwn) {
+  struct Write {
+    const char* share;
+    const char* suffix;  // "" for the live queue, ".tmp" for the snapshot
+    std::string text;
+  };
   struct Case {
     const char* what;
-    std::function<void()> prepare;
+    std::vector<Write> writes;
+    std::function<void()> before = [] {};  // run before the writes
   };
   const Case cases[] = {
-      {"no queues", [] {}},
+      {"no queues", {}},
       {"events under some folders, a rename out of another",
-       [&] {
-         WriteQueue("s1", "", Line(2, s1_ + "/a/sub/x") + Line(256, "/elsewhere", s1_ + "/c/y"));
-         WriteQueue("s2", "", Line(2, s2_ + "/bb") + Line(2, s2_ + "/b"));
-       }},
-      {"snapshot only", [&] { WriteQueue("s1", ".tmp", Line(2, s1_ + "/b/f")); }},
+       {{"s1", "", Line(2, s1_ + "/a/sub/x") + Line(256, "/elsewhere", s1_ + "/c/y")},
+        {"s2", "", Line(2, s2_ + "/bb") + Line(2, s2_ + "/b")}}},
+      {"snapshot only", {{"s1", ".tmp", Line(2, s1_ + "/b/f")}}},
       {"live and snapshot",
-       [&] {
-         WriteQueue("s1", "", Line(2, s1_ + "/a/f"));
-         WriteQueue("s1", ".tmp", Line(2, s1_ + "/b/f"));
-       }},
+       {{"s1", "", Line(2, s1_ + "/a/f")}, {"s1", ".tmp", Line(2, s1_ + "/b/f")}}},
       {"a last line still being written",
-       [&] {
-         WriteQueue("s1", "", Line(2, s1_ + "/b/x") + R"({"event":2,"path":")" + s1_ + "/a/y\"}");
-       }},
+       {{"s1", "", Line(2, s1_ + "/b/x") + R"({"event":2,"path":")" + s1_ + "/a/y\"}"}}},
       {"malformed line after a's match, before b's",
-       [&] { WriteQueue("s1", "", Line(2, s1_ + "/a/x") + "garbage\n" + Line(2, s1_ + "/b/x")); }},
-      {"malformed first line", [&] { WriteQueue("s1", "", "{\n"); }},
+       {{"s1", "", Line(2, s1_ + "/a/x") + "garbage\n" + Line(2, s1_ + "/b/x")}}},
+      {"malformed first line", {{"s1", "", "{\n"}}},
       {"malformed line after every match",
-       [&] {
-         WriteQueue("s1", "",
-                    Line(2, s1_ + "/a/sub/x") + Line(2, s1_ + "/b") + Line(2, s1_ + "/c") + "{x\n");
-       }},
+       {{"s1", "",
+         Line(2, s1_ + "/a/sub/x") + Line(2, s1_ + "/b") + Line(2, s1_ + "/c") + "{x\n"}}},
       {"malformed live, match in the snapshot",
-       [&] {
-         WriteQueue("s2", "", "nope\n");
-         WriteQueue("s2", ".tmp", Line(2, s2_ + "/a/1"));
-       }},
-      {"queue path is a directory", [&] { std::filesystem::create_directories(QueuePath("s2")); }},
+       {{"s2", "", "nope\n"}, {"s2", ".tmp", Line(2, s2_ + "/a/1")}}},
+      {"queue path is a directory",
+       {},
+       [&] { std::filesystem::create_directories(QueuePath("s2")); }},
       {"need-reindex share with a malformed queue",
-       [&] {
-         StatusMgr().SetShareStatus("s2", NeedReindex);
-         WriteQueue("s2", "", "nope\n");
-       }},
-      {"pause without end",
-       [&] {
-         StatusMgr().Pause(0);
-         WriteQueue("s3", "", Line(2, s3_ + "/a/1"));
-       }},
-      {"pause in the future",
-       [&] {
-         StatusMgr().Pause(5);
-         WriteQueue("s3", "", Line(2, s3_ + "/a/1"));
-       }},
+       {{"s2", "", "nope\n"}},
+       [] { StatusMgr().SetShareStatus("s2", NeedReindex); }},
+      {"pause without end", {{"s3", "", Line(2, s3_ + "/a/1")}}, [] { StatusMgr().Pause(0); }},
+      {"pause in the future", {{"s3", "", Line(2, s3_ + "/a/1")}}, [] { StatusMgr().Pause(5); }},
   };
   struct Request {
     unsigned offset, limit;
@@ -155,27 +143,19 @@ TEST_F(FolderListTest, StatusesMatchEachFolderAskedOnItsOwn) {
   for (const Case& c : cases) {
     ClearQueues();
     std::filesystem::remove(portable::RootPath(kFileIndexStatusCfgPath));
-    c.prepare();
+    c.before();
+    for (const Write& w : c.writes) WriteQueue(w.share, w.suffix, w.text);
     for (const Request& r : requests) {
       Json::Value additional;
       ASSERT_TRUE(fromString(additional, r.additional));
       Json::Value naive, fast;
       std::vector<std::string> naive_log, fast_log;
-      testing::Outcome naive_outcome, fast_outcome;
-      {
-        testing::LogCapture log;
-        errno = 0;
-        naive_outcome = OutcomeOf(
-            [&] { naive = NaiveList(r.offset, r.limit, r.sort_by, r.direction, additional); });
-        naive_log = WithoutLineNumbers(log.lines());
-      }
-      {
-        testing::LogCapture log;
-        errno = 0;
-        fast_outcome = OutcomeOf(
-            [&] { FolderList(fast, r.offset, r.limit, r.sort_by, r.direction, additional); });
-        fast_log = WithoutLineNumbers(log.lines());
-      }
+      const testing::Outcome naive_outcome = ListAndLog(
+          [&] { naive = NaiveList(r.offset, r.limit, r.sort_by, r.direction, additional); },
+          &naive_log);
+      const testing::Outcome fast_outcome = ListAndLog(
+          [&] { FolderList(fast, r.offset, r.limit, r.sort_by, r.direction, additional); },
+          &fast_log);
       const std::string where = std::string(c.what) + " / " + r.sort_by + " " + r.direction + " " +
                                 std::to_string(r.offset) + "+" + std::to_string(r.limit) + " " +
                                 r.additional;

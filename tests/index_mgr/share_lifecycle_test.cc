@@ -124,15 +124,6 @@ TEST_F(ShareLifecycleTest, MissingArgumentsAreRefusedInOrder) {
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
-TEST_F(ShareLifecycleTest, SettingChangeNoticeCarriesTheShareAndDirection) {
-  NotifySettingChanged("s1", true);
-  NotifySettingChanged("s1", false);
-  EXPECT_THAT(
-      Requests(),
-      ElementsAre(R"(fileindexd notify_setting_changed {"is_upsert":true,"share_name":"s1"})",
-                  R"(fileindexd notify_setting_changed {"is_upsert":false,"share_name":"s1"})"));
-}
-
 }  // namespace
 }  // namespace fileindex
 }  // namespace orvex

@@ -39,12 +39,7 @@ Json::Value Description(const std::string& queue, const std::vector<std::string>
 }
 
 Json::Value ReadJson(const std::string& path) {
-  Json::Value value;
-  Json::CharReaderBuilder builder;
-  std::string errors;
-  std::istringstream in(orvex::testing::ReadFileText(path));
-  EXPECT_TRUE(Json::parseFromStream(builder, in, &value, &errors)) << path << ": " << errors;
-  return value;
+  return orvex::testing::Options(orvex::testing::ReadFileText(path));
 }
 
 std::vector<std::string> FilesIn(const std::string& dir) {
