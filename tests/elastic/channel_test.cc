@@ -6,12 +6,12 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstdio>
 #include <string>
 #include <vector>
 
 #include "elastic/elastic_test_root.h"
+#include "foundation/fault_helpers.h"
 #include "orvex/foundation/json.h"
 #include "support/error_code.h"
 
@@ -27,17 +27,8 @@ using testing::Options;
 
 class ChannelTest : public testing::ElasticTestRoot {
  protected:
-  // "elastic_control:<line> (<pid>, <euid>) " + text, errno suffix allowed.
-  void ExpectLogLine(const std::string& line, const std::string& text) {
-    ASSERT_EQ(0u, line.rfind("elastic_control:", 0)) << line;
-    const std::string ids =
-        " (" + std::to_string(::getpid()) + ", " + std::to_string(::geteuid()) + ") ";
-    const size_t at = line.find(ids);
-    ASSERT_NE(std::string::npos, at) << line;
-    const std::string rest = line.substr(at + ids.size());
-    EXPECT_EQ(0u, rest.rfind(text, 0)) << line;
-    const std::string tail = rest.substr(std::min(rest.size(), text.size()));
-    EXPECT_TRUE(tail.empty() || tail.rfind(" [err: ", 0) == 0) << line;
+  static void ExpectLogLine(const std::string& line, const std::string& text) {
+    EXPECT_TRUE(testing::IsLogLine(line, "elastic_control", text));
   }
 
   const Json::Value pause_ =

@@ -1,9 +1,11 @@
-// Helpers for failure-path tests: the exact log line of a failed check, and a
+// Helpers for failure-path tests: the exact log line of a failed check or of
+// any logged text, and a
 // lowered resource limit that makes system calls fail even for root. One
 // thread at a time (ScopedRlimit changes the whole process).
 #ifndef ORVEX_TESTS_FOUNDATION_FAULT_HELPERS_H_
 #define ORVEX_TESTS_FOUNDATION_FAULT_HELPERS_H_
 
+#include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -27,6 +29,21 @@ inline std::string CheckLine(const std::string& source, const std::string& condi
                              const std::string& reason) {
   return source + ":N (" + std::to_string(::getpid()) + ", " + std::to_string(::geteuid()) +
          ") Failed [" + condition + "], reason: " + reason;
+}
+
+// Whether line is what source logs for text: "<source>:<n> (<pid>, <euid>)
+// <text>", followed at most by the errno suffix " [err: ...]".
+inline ::testing::AssertionResult IsLogLine(const std::string& line, const std::string& source,
+                                            const std::string& text) {
+  const std::string want = source + ":N (" + std::to_string(::getpid()) + ", " +
+                           std::to_string(::geteuid()) + ") " + text;
+  const std::string seen = WithoutLineNumber(line);
+  if (seen.rfind(want, 0) != 0) return ::testing::AssertionFailure() << line;
+  const std::string tail = seen.substr(want.size());
+  if (!tail.empty() && tail.rfind(" [err: ", 0) != 0) {
+    return ::testing::AssertionFailure() << "more than an errno after the text: " << line;
+  }
+  return ::testing::AssertionSuccess();
 }
 
 // Lowers one resource limit for a scope. Writes past an RLIMIT_FSIZE limit
