@@ -52,48 +52,39 @@ std::vector<std::string> FilesIn(const std::string& dir) {
 class MonitorQueueTest : public orvex::testing::ShareTestRoot {
  protected:
   std::string AppDir() const { return dir_.Join("var/lib/orvex/monitor/fileindex"); }
+  static bool Upsert(const Json::Value& desc, const std::string& app = "fileindex") {
+    return MonitorQueue::Upsert(MonitorQueue(desc), app, MONITOR_QUEUE_TYPE_APPLICATION);
+  }
+  static bool Delete(const std::string& queue, const std::string& app = "fileindex") {
+    return MonitorQueue::Delete(queue, app, MONITOR_QUEUE_TYPE_APPLICATION);
+  }
 };
 
-TEST_F(MonitorQueueTest, UpsertWritesOneFileWithTheDescription) {
+TEST_F(MonitorQueueTest, UpsertWritesOneFileReplacedWholeAndDeleteRemovesIt) {
   const std::string queue = "/volume1/photo/@eaDir/@fileindex/queue";
-  ASSERT_TRUE(MonitorQueue::Upsert(
-      MonitorQueue(Description(queue, {"/volume1/photo/a", "/volume1/photo/b"})), "fileindex",
-      MONITOR_QUEUE_TYPE_APPLICATION));
   const std::string file = MonitorRegistrationPath(queue, "fileindex");
   EXPECT_EQ(AppDir() + "/%2Fvolume1%2Fphoto%2F@eaDir%2F@fileindex%2Fqueue.json", file);
+  ASSERT_TRUE(Upsert(Description(queue, {"/volume1/photo/a", "/volume1/photo/b"})));
   EXPECT_EQ(std::vector<std::string>{fs::path(file).filename()}, FilesIn(AppDir()));
   EXPECT_EQ(Description(queue, {"/volume1/photo/a", "/volume1/photo/b"}), ReadJson(file));
   struct stat st;
   ASSERT_EQ(0, ::stat(file.c_str(), &st));
   EXPECT_EQ(0644u, st.st_mode & 07777);
-}
-
-TEST_F(MonitorQueueTest, UpsertReplacesTheFolderList) {
-  const std::string queue = "/v/s/@eaDir/@fileindex/queue";
-  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s/a", "/v/s/b"})),
-                                   "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
-  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s/c"})), "fileindex",
-                                   MONITOR_QUEUE_TYPE_APPLICATION));
+  ASSERT_TRUE(Upsert(Description(queue, {"/volume1/photo/c"})));
   EXPECT_EQ(1u, FilesIn(AppDir()).size());
-  EXPECT_EQ(Description(queue, {"/v/s/c"}), ReadJson(MonitorRegistrationPath(queue, "fileindex")));
+  EXPECT_EQ(Description(queue, {"/volume1/photo/c"}), ReadJson(file));
+  EXPECT_TRUE(Delete(queue));
+  EXPECT_TRUE(FilesIn(AppDir()).empty());
+  EXPECT_TRUE(Delete(queue)) << "an absent queue counts as removed";
+  EXPECT_TRUE(Delete("/never/registered", "other"));
 }
 
 TEST_F(MonitorQueueTest, MissingIgnoreIsStoredEmpty) {
   Json::Value desc = Description("/v/s/q", {"/v/s"});
   desc["config"][0].removeMember("ignore");
-  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(desc), "app", MONITOR_QUEUE_TYPE_APPLICATION));
+  ASSERT_TRUE(Upsert(desc, "app"));
   desc["config"][0]["ignore"] = Json::Value(Json::arrayValue);
   EXPECT_EQ(desc, ReadJson(MonitorRegistrationPath("/v/s/q", "app")));
-}
-
-TEST_F(MonitorQueueTest, DeleteRemovesAndAnAbsentQueueCountsAsRemoved) {
-  const std::string queue = "/v/s/@eaDir/@fileindex/queue";
-  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s"})), "fileindex",
-                                   MONITOR_QUEUE_TYPE_APPLICATION));
-  EXPECT_TRUE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
-  EXPECT_TRUE(FilesIn(AppDir()).empty());
-  EXPECT_TRUE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
-  EXPECT_TRUE(MonitorQueue::Delete("/never/registered", "other", MONITOR_QUEUE_TYPE_APPLICATION));
 }
 
 TEST_F(MonitorQueueTest, RefusesBadInputWithoutWriting) {
@@ -137,7 +128,7 @@ TEST_F(MonitorQueueTest, RefusesBadInputWithoutWriting) {
   }
   EXPECT_FALSE(fs::exists(dir_.Join("var/lib/orvex/monitor/fileindex")));
   errno = 0;
-  EXPECT_FALSE(MonitorQueue::Delete("relative", "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_FALSE(Delete("relative"));
   EXPECT_EQ(EINVAL, errno);
 }
 
@@ -157,9 +148,7 @@ TEST_F(MonitorQueueTest, FileNamesAreDistinctAndShort) {
   }
   EXPECT_EQ(queues.size(), names.size());
   for (const std::string& q : queues) {
-    ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Description(q, {"/v/s"})), "fileindex",
-                                     MONITOR_QUEUE_TYPE_APPLICATION))
-        << q;
+    ASSERT_TRUE(Upsert(Description(q, {"/v/s"}))) << q;
     EXPECT_EQ(q, ReadJson(MonitorRegistrationPath(q, "fileindex"))["queue"].asString());
   }
   EXPECT_EQ(queues.size(), FilesIn(AppDir()).size());
@@ -173,10 +162,9 @@ TEST_F(MonitorQueueTest, AFileOfAnotherQueueIsNotReplaced) {
   // As if another queue's long path had hashed to the same name.
   dir_.Write(fs::relative(file, dir_.path()), "{\"queue\": \"/v/other\", \"config\": []}");
   errno = 0;
-  EXPECT_FALSE(MonitorQueue::Upsert(MonitorQueue(Description(queue, {"/v/s"})), "fileindex",
-                                    MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_FALSE(Upsert(Description(queue, {"/v/s"})));
   EXPECT_EQ(EEXIST, errno);
-  EXPECT_FALSE(MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  EXPECT_FALSE(Delete(queue));
   EXPECT_EQ("/v/other", ReadJson(file)["queue"].asString());
 }
 
