@@ -26,6 +26,8 @@ TEST(DaemonUsageTest, HelpAndVersion) {
   } cases[] = {
       {"kalonotifyd", "fs.inotify.max_user_watches"},
       {"kalocontentextractd", "ORVEX_EXTRACT_FAULTS"},
+      {"fileindexd", "/var/run/fileindexd.pid"},
+      {"kaloelasticd", "/var/run/kaloelasticd.pid"},
   };
   TempDir io;
   for (const auto& c : cases) {
@@ -48,6 +50,8 @@ TEST(DaemonUsageTest, BadUsageIsNamedBeforeTheUsage) {
     const char* reason;
   } cases[] = {
       {"kalonotifyd", {"--bogus"}, "unknown argument --bogus"},
+      {"fileindexd", {"--bogus"}, "unknown argument --bogus"},
+      {"kaloelasticd", {"--bogus"}, "unknown argument --bogus"},
       {"kalonotifyd", {"--foreground", "extra"}, "unknown argument extra"},
       {"kalonotifyd", {"--status-interval"}, "--status-interval needs a value"},
       {"kalonotifyd",

@@ -8,7 +8,7 @@
 #include <iterator>
 
 #include "orvex/version.h"
-#include "programs/program_test.h"
+#include "support/program_test.h"
 
 namespace orvex {
 namespace testing {

@@ -19,7 +19,7 @@
 #include "kalo/kalo_sock.h"
 #include "orvex/portable/extract_protocol.h"
 #include "orvex/portable/file_descriptor.h"
-#include "programs/program_test.h"
+#include "support/program_test.h"
 #include "support/sanitizer.h"
 
 namespace orvex {

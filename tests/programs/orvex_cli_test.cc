@@ -14,8 +14,8 @@
 #include <sstream>
 
 #include "orvex/version.h"
-#include "programs/program_test.h"
 #include "support/framed_peer.h"
+#include "support/program_test.h"
 
 namespace orvex {
 namespace testing {

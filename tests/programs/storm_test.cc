@@ -24,8 +24,8 @@
 #include "orvex/foundation/json.h"
 #include "orvex/policy/custom_event.h"
 #include "orvex/queue/event.h"
-#include "programs/program_test.h"
 #include "support/ask_daemon.h"
+#include "support/program_test.h"
 
 namespace orvex {
 namespace testing {

@@ -11,7 +11,7 @@
 #include <string>
 #include <thread>
 
-#include "programs/program_test.h"
+#include "support/program_test.h"
 
 namespace orvex {
 namespace testing {

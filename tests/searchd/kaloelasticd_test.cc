@@ -2,24 +2,19 @@
 // command returns once the socket is ready), talked to by the library's own
 // search-engine client and by raw sockets, stopped with SIGTERM.
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
-#include <unistd.h>
 
-#include <cstring>
 #include <filesystem>
 #include <string>
 #include <vector>
 
-#include "kalo/kalo_sock.h"
 #include "orvex/elastic.h"
-#include "orvex/version.h"
 #include "search/search_error.h"
 #include "searchd/searchd_fixture.h"
-#include "support/run_program.h"
+#include "support/ask_daemon.h"
+#include "support/program_test.h"
 
 namespace orvex {
 namespace testing {
@@ -27,65 +22,22 @@ namespace {
 
 constexpr char kId[] = "fileindex_s";
 
-class KaloelasticdTest : public ::testing::Test {
+class KaloelasticdTest : public ProgramTest {
  protected:
-  void TearDown() override {
-    if (pid_ > 0) {
-      EXPECT_TRUE(Stop());
-    }
-  }
+  KaloelasticdTest() : ProgramTest("kaloelasticd") {}
+  void TearDown() override { EXPECT_TRUE(daemon_.pid() < 0 || daemon_.Stop() == 0); }
 
-  ProgramOutcome Run(const std::vector<std::string>& args) {
-    return RunProgram(program_, args, {"ORVEX_ROOT=" + root_.path()}, io_.path());
-  }
-
-  void Start() {
-    const ProgramOutcome started = Run({});
-    ASSERT_EQ(0, started.status) << started.err;
-    pid_ = std::stoi(ReadFileText(root_.Join("var/run/kaloelasticd.pid")));
-  }
-
-  // SIGTERM, then waits for the daemon (not our child) to be gone; false
-  // when it is still there after ten seconds.
-  bool Stop() {
-    const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
-    if (pidfd < 0) return false;
-    ::kill(pid_, SIGTERM);
-    struct pollfd p = {pidfd, POLLIN, 0};
-    const bool gone = ::poll(&p, 1, 10000) == 1;
-    ::close(pidfd);
-    pid_ = -1;
-    return gone;
-  }
-
+  void Start() { StartDetached(daemon_, "kaloelasticd"); }
   std::string SocketPath() const { return root_.Join("var/run/kaloelasticd.sock"); }
 
-  Json::Value Ask(const Json::Value& request) {
-    kalodaemon::DomainSockConnection connection(SocketPath());
-    EXPECT_TRUE(connection.Connect()) << std::strerror(errno);
-    EXPECT_TRUE(connection.Send(toString(request)));
-    std::string answer;
-    EXPECT_TRUE(connection.Recv(answer)) << std::strerror(errno);
-    return ParseJson(answer);
-  }
-
   Json::Value Ok(const Json::Value& request) {
-    const Json::Value answer = Ask(request);
+    const Json::Value answer = AskDaemon(SocketPath(), request);
     EXPECT_TRUE(answer["success"].asBool()) << toString(request) << " -> " << toString(answer);
     return answer;
   }
 
-  // Reads one framed answer from a raw socket (blocking).
-  Json::Value ReadAnswer(int fd) {
-    uint32_t length = 0;
-    if (::recv(fd, &length, sizeof(length), MSG_WAITALL) != sizeof(length)) return Json::Value();
-    std::string body(length, '\0');
-    if (::recv(fd, &body[0], length, MSG_WAITALL) != static_cast<ssize_t>(length)) {
-      return Json::Value();
-    }
-    body.pop_back();
-    return ParseJson(body);
-  }
+  // One framed answer from a raw socket.
+  static Json::Value ReadAnswer(int fd) { return BodyJson(ReadFrame(fd)); }
 
   void CreateIndex() {
     Json::Value req = Command("index_create", kId);
@@ -95,31 +47,10 @@ class KaloelasticdTest : public ::testing::Test {
     Ok(req);
   }
 
-  void StillServing() {
-    Json::Value stats;
-    stats["command"] = "stats";
-    stats["data"] = Json::Value(Json::objectValue);
-    Ok(stats);
-  }
+  void StillServing() { Ok(Request("stats")); }
 
-  const std::string program_ = std::string(ORVEX_BUILD_DIR) + "/kaloelasticd";
-  TempDir root_;
-  TempDir io_;
-  ScopedOrvexRoot scoped_root_{root_.path()};
-  pid_t pid_ = -1;
+  DaemonProcess daemon_;
 };
-
-TEST_F(KaloelasticdTest, HelpVersionAndBadUsage) {
-  ProgramOutcome run = Run({"--help"});
-  EXPECT_EQ(0, run.status);
-  EXPECT_NE(std::string::npos, run.out.find("--foreground"));
-  run = Run({"--version"});
-  EXPECT_EQ(0, run.status);
-  EXPECT_EQ(std::string("kaloelasticd ") + ORVEX_VERSION + "\n", run.out);
-  run = Run({"--bogus"});
-  EXPECT_EQ(2, run.status);
-  EXPECT_NE(std::string::npos, run.err.find("usage:"));
-}
 
 TEST_F(KaloelasticdTest, SocketIsMode0660AndASecondDaemonIsRefused) {
   Start();
@@ -168,51 +99,32 @@ TEST_F(KaloelasticdTest, DirectoryRenameThroughTheLibraryMovesEveryDescendant) {
   EXPECT_EQ(0u, Ok(PrefixQuery("document_get_by_query", kId, "/v/s/a/"))["data"].size());
   EXPECT_EQ((std::vector<std::string>{"/v/s/ab/keep.txt"}),
             DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/ab/"))));
-  Json::Value search;
-  search["command"] = "search";
-  search["data"]["name"] = "f987.txt";
-  EXPECT_EQ(std::vector<std::string>{"/v/s/b/d7/f987.txt"}, HitPaths(Ok(search)));
-  search["data"] = Json::Value(Json::objectValue);
-  search["data"]["folder"] = "/v/s/a";
-  EXPECT_EQ(0, Ok(search)["data"]["total"].asInt());
-  search["data"]["folder"] = "/v/s";
-  search["data"]["type"] = "dir";
+  EXPECT_EQ(std::vector<std::string>{"/v/s/b/d7/f987.txt"},
+            HitPaths(Ok(Request("search", R"({"name": "f987.txt"})"))));
+  EXPECT_EQ(0, Ok(Request("search", R"({"folder": "/v/s/a"})"))["data"]["total"].asInt());
   EXPECT_EQ((std::vector<std::string>{"/v/s/ab", "/v/s/b", "/v/s/b/d0", "/v/s/b/d1", "/v/s/b/d2",
                                       "/v/s/b/d3", "/v/s/b/d4", "/v/s/b/d5", "/v/s/b/d6",
                                       "/v/s/b/d7", "/v/s/b/d8", "/v/s/b/d9"}),
-            HitPaths(Ok(search)));
+            HitPaths(Ok(Request("search", R"({"folder": "/v/s", "type": "dir"})"))));
 }
 
-TEST_F(KaloelasticdTest, RestartKeepsWhatWasCommitted) {
+// What was committed outlives a stop and a kill; what was not is dropped.
+TEST_F(KaloelasticdTest, TheNextDaemonHasTheLastCommitAfterAStopOrAKill) {
   Start();
   CreateIndex();
-  Ok(Upsert(kId, FileDoc("/v/s/kept.txt")));
-  Ok(Command("commit", kId));
-  Ok(Upsert(kId, FileDoc("/v/s/dropped.txt")));
-  ASSERT_TRUE(Stop());
-  EXPECT_FALSE(std::filesystem::exists(SocketPath()));
-  Start();
-  EXPECT_EQ(std::vector<std::string>{"/v/s/kept.txt"},
-            DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/"))));
-}
-
-TEST_F(KaloelasticdTest, AfterKillNineTheNextDaemonTakesOverTheSocketAndTheLastCommit) {
-  Start();
-  CreateIndex();
-  Ok(Upsert(kId, FileDoc("/v/s/kept.txt")));
-  Ok(Command("commit", kId));
-  Ok(Upsert(kId, FileDoc("/v/s/lost.txt")));
-  const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
-  ASSERT_GE(pidfd, 0);
-  ASSERT_EQ(0, ::kill(pid_, SIGKILL));
-  struct pollfd gone = {pidfd, POLLIN, 0};
-  EXPECT_EQ(1, ::poll(&gone, 1, 10000));
-  ::close(pidfd);
-  pid_ = -1;
-  ASSERT_TRUE(std::filesystem::exists(SocketPath()));  // left behind
-  Start();
-  EXPECT_EQ(std::vector<std::string>{"/v/s/kept.txt"},
-            DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/"))));
+  std::vector<std::string> kept;
+  for (const int sig : {SIGTERM, SIGKILL}) {
+    SCOPED_TRACE(sig);
+    kept.push_back("/v/s/kept" + std::to_string(sig));  // 15, then 9: in path order
+    Ok(Upsert(kId, FileDoc(kept.back())));
+    Ok(Command("commit", kId));
+    Ok(Upsert(kId, FileDoc("/v/s/lost" + std::to_string(sig))));
+    ASSERT_EQ(0, daemon_.Stop(sig));
+    // A stopped daemon removes its socket; the next one takes over a killed one's.
+    EXPECT_EQ(sig == SIGKILL, std::filesystem::exists(SocketPath()));
+    Start();
+    EXPECT_EQ(kept, DocPaths(Ok(PrefixQuery("document_get_by_query", kId, "/v/s/"))));
+  }
 }
 
 TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
@@ -237,7 +149,7 @@ TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
        search::kBadIndexId},
   };
   for (const auto& c : cases) {
-    FileDescriptor fd = ConnectRaw(SocketPath());
+    FileDescriptor fd = ConnectUnix(SocketPath());
     ASSERT_TRUE(SendBytes(fd.get(), c.bytes)) << c.what;
     if (c.shut_write) ::shutdown(fd.get(), SHUT_WR);
     const Json::Value answer = ReadAnswer(fd.get());
@@ -247,7 +159,7 @@ TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
     StillServing();
   }
   // After a bad request (not a bad frame) the same connection serves on.
-  FileDescriptor fd = ConnectRaw(SocketPath());
+  FileDescriptor fd = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(fd.get(), Framed("{oops")));
   EXPECT_EQ(search::kBadJson, ReadAnswer(fd.get())["error"]["code"].asInt());
   ASSERT_TRUE(SendBytes(fd.get(), Framed(toString(Command("commit", kId)))));
@@ -257,11 +169,11 @@ TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
 TEST_F(KaloelasticdTest, SilentAndHalfSentClientsHoldUpNobody) {
   Start();
   CreateIndex();
-  FileDescriptor silent = ConnectRaw(SocketPath());
-  FileDescriptor half = ConnectRaw(SocketPath());
+  FileDescriptor silent = ConnectUnix(SocketPath());
+  FileDescriptor half = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(half.get(), LengthWord(1000) + "{\"command\": "));
   std::vector<FileDescriptor> crowd;
-  for (int i = 0; i < 50; ++i) crowd.push_back(ConnectRaw(SocketPath()));
+  for (int i = 0; i < 50; ++i) crowd.push_back(ConnectUnix(SocketPath()));
   Ok(Upsert(kId, FileDoc("/v/s/meanwhile")));
   Ok(Command("commit", kId));
   StillServing();
@@ -279,28 +191,22 @@ TEST_F(KaloelasticdTest, SigtermFinishesTheAnswerBeingWritten) {
   Ok(compound);
   // An answer of about 2 MB, far more than the socket holds: the daemon is
   // still writing it when the signal comes.
-  FileDescriptor fd = ConnectRaw(SocketPath());
+  FileDescriptor fd = ConnectUnix(SocketPath());
   ASSERT_TRUE(
       SendBytes(fd.get(), Framed(toString(PrefixQuery("document_get_by_query", kId, "/v/s/")))));
   struct pollfd p = {fd.get(), POLLIN, 0};
   ASSERT_EQ(1, ::poll(&p, 1, 10000));
-  const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
-  ASSERT_GE(pidfd, 0);
-  ASSERT_EQ(0, ::kill(pid_, SIGTERM));
+  ASSERT_TRUE(daemon_.Signal(SIGTERM));
   const Json::Value answer = ReadAnswer(fd.get());
   EXPECT_TRUE(answer["success"].asBool());
   EXPECT_EQ(4000u, answer["data"].size());
-  struct pollfd gone = {pidfd, POLLIN, 0};
-  EXPECT_EQ(1, ::poll(&gone, 1, 10000));
-  ::close(pidfd);
-  pid_ = -1;
+  EXPECT_EQ(0, daemon_.Wait());
   EXPECT_FALSE(std::filesystem::exists(SocketPath()));
 }
 
 TEST_F(KaloelasticdTest, TheToolSearchesAndShowsStats) {
-  const std::string orvex = std::string(ORVEX_BUILD_DIR) + "/orvex";
   auto tool = [&](const std::vector<std::string>& args) {
-    return RunProgram(orvex, args, {"ORVEX_ROOT=" + root_.path()}, io_.path());
+    return RunIn(BuiltProgram("orvex"), args);
   };
   ProgramOutcome run = tool({"stats"});
   EXPECT_EQ(2, run.status);

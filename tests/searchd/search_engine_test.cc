@@ -56,9 +56,7 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   Json::Value gone = FileDoc("/v/s/ephemeral.txt");
   gone["KALOMDTextContent"] = "vanishing words";
   Ok(Upsert(kId, gone));
-  Json::Value del = Command("document_del_by_id", kId);
-  del["data"]["doc_id"] = "/v/s/ephemeral.txt";
-  EXPECT_EQ(1, Ok(del)["data"]["deleted"].asInt());
+  EXPECT_EQ(1, Ok(DelById(kId, "/v/s/ephemeral.txt"))["data"]["deleted"].asInt());
   // Not committed: not searchable yet.
   EXPECT_EQ(Paths{}, HitPaths(SearchName("alpha")));
   Commit();
@@ -110,22 +108,17 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   // Documents of names alone: the newest committed row removed before new
   // ones come; new ones sent again, renamed or removed before the commit;
   // an older one renamed.
-  auto remove = [&](const std::string& path) {
-    Json::Value r = Command("document_del_by_id", kId);
-    r["data"]["doc_id"] = path;
-    Ok(r);
-  };
   Ok(Upsert(kId, FileDoc("/v/s/one.txt")));
   Ok(Upsert(kId, FileDoc("/v/s/two.txt")));
   Commit();
-  remove("/v/s/two.txt");
+  Ok(DelById(kId, "/v/s/two.txt"));
   Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
   Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
   Json::Value four;
   four["KALOMDSearchFileName"] = "four.txt";
   Ok(SetById(kId, "/v/s/three.txt", four));
   Ok(Upsert(kId, FileDoc("/v/s/five.txt")));
-  remove("/v/s/five.txt");
+  Ok(DelById(kId, "/v/s/five.txt"));
   Json::Value six;
   six["KALOMDSearchFileName"] = "six.txt";
   Ok(SetById(kId, "/v/s/one.txt", six));
@@ -164,19 +157,9 @@ TEST_F(SearchEngineTest, UpsertThenSetKeepsThePropertiesNotSet) {
   EXPECT_EQ(4096, docs[0]["KALOMDFSSize"].asInt());
   EXPECT_EQ(1800000000, docs[0]["KALOMDFSContentChangeDate"].asInt());
   // The text content survives the set too: a text search still finds it.
-  Json::Value text;
-  text["text"] = "freeloader";
-  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"}, HitPaths(SearchFor(text)));
-  Json::Value size;
-  size["size_min"] = 4096;
-  size["size_max"] = 4096;
-  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"}, HitPaths(SearchFor(size)));
-}
-
-TEST_F(SearchEngineTest, SetOfAMissingDocumentIsAnError) {
-  Json::Value attrs;
-  attrs["KALOMDFSSize"] = 1;
-  EXPECT_EQ(search::kNoSuchDocument, ErrorCode(SetById(kId, "/v/s/never", attrs)));
+  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"}, Found(R"({"text": "freeloader"})"));
+  EXPECT_EQ(std::vector<std::string>{"/v/s/song.mp3"},
+            Found(R"({"size_min": 4096, "size_max": 4096})"));
 }
 
 TEST_F(SearchEngineTest, DeleteByPrefixLeavesTheDirectoryAndItsLookalikeSiblings) {
@@ -220,31 +203,22 @@ TEST_F(SearchEngineTest, GetByPrefixPagesInPathOrderAfterAGivenPath) {
   EXPECT_FALSE(whole.isMember("more"));
 }
 
-TEST_F(SearchEngineTest, DeleteByIdRemovesOneDocument) {
-  Ok(Upsert(kId, FileDoc("/v/s/a")));
-  Ok(Upsert(kId, FileDoc("/v/s/b")));
-  Json::Value del = Command("document_del_by_id", kId);
-  del["data"]["doc_id"] = "/v/s/a";
-  EXPECT_EQ(1, Ok(del)["data"]["deleted"].asInt());
-  EXPECT_EQ(0, Ok(del)["data"]["deleted"].asInt());  // again: nothing left, still fine
-  Commit();
-  EXPECT_EQ(std::vector<std::string>{"/v/s/b"}, DocPaths(GetByPrefix("/v/s/")));
-  EXPECT_EQ(std::vector<std::string>{"/v/s/b"}, HitPaths(SearchName("")));
-}
-
+// Searches see committed documents only; the indexer's own query sees its
+// uncommitted writes (a rename needs them).
 TEST_F(SearchEngineTest, NothingIsVisibleToASearchBeforeCommit) {
+  using Paths = std::vector<std::string>;
   Ok(Upsert(kId, FileDoc("/v/s/report.pdf")));
+  Ok(Upsert(kId, FileDoc("/v/s/b")));
   EXPECT_EQ(0, SearchName("report")["data"]["total"].asInt());
-  // The indexer's own query sees its uncommitted writes (a rename needs them).
-  EXPECT_EQ(std::vector<std::string>{"/v/s/report.pdf"}, DocPaths(GetByPrefix("/v/s/")));
+  EXPECT_EQ((Paths{"/v/s/b", "/v/s/report.pdf"}), DocPaths(GetByPrefix("/v/s/")));
   Commit();
-  EXPECT_EQ(std::vector<std::string>{"/v/s/report.pdf"}, HitPaths(SearchName("report")));
-  Json::Value del = Command("document_del_by_id", kId);
-  del["data"]["doc_id"] = "/v/s/report.pdf";
-  Ok(del);
+  EXPECT_EQ(Paths{"/v/s/report.pdf"}, HitPaths(SearchName("report")));
+  EXPECT_EQ(1, Ok(DelById(kId, "/v/s/report.pdf"))["data"]["deleted"].asInt());
+  EXPECT_EQ(0, Ok(DelById(kId, "/v/s/report.pdf"))["data"]["deleted"].asInt());  // still fine
   EXPECT_EQ(1, SearchName("report")["data"]["total"].asInt());
+  EXPECT_EQ(Paths{"/v/s/b"}, DocPaths(GetByPrefix("/v/s/")));
   Commit();
-  EXPECT_EQ(0, SearchName("report")["data"]["total"].asInt());
+  EXPECT_EQ(Paths{"/v/s/b"}, HitPaths(SearchName("")));
 }
 
 TEST_F(SearchEngineTest, ACompoundAnswersEachSubRequestAndMarksTheFailure) {
@@ -279,11 +253,8 @@ TEST_F(SearchEngineTest, SetWithANewPathMovesTheDocument) {
   Ok(SetById(kId, "/v/s/old/a.txt", moved));
   Commit();
   EXPECT_EQ(std::vector<std::string>{"/v/s/new/a.txt"}, DocPaths(GetByPrefix("/v/s/")));
-  Json::Value folder;
-  folder["folder"] = "/v/s/new";
-  EXPECT_EQ(std::vector<std::string>{"/v/s/new/a.txt"}, HitPaths(SearchFor(folder)));
-  folder["folder"] = "/v/s/old";
-  EXPECT_EQ(0, SearchFor(folder)["data"]["total"].asInt());
+  EXPECT_EQ(std::vector<std::string>{"/v/s/new/a.txt"}, Found(R"({"folder": "/v/s/new"})"));
+  EXPECT_EQ(std::vector<std::string>{}, Found(R"({"folder": "/v/s/old"})"));
 }
 
 // Every length of fragment, in any case, against a naive scan of the same
@@ -356,12 +327,9 @@ TEST_F(SearchEngineTest, CommonFragmentsPageInNameOrderLikeTheModel) {
     if (descending) std::reverse(model.begin(), model.end());
     std::vector<std::string> expected;
     for (size_t i = 10; i < 60; ++i) expected.push_back(model[i].second);
-    Json::Value q;
-    q["name"] = "pHoTo";
-    q["offset"] = 10;
-    q["limit"] = 50;
-    if (descending) q["order"] = "desc";
-    const Json::Value answer = SearchFor(q);
+    const Json::Value answer =
+        SearchFor(ParseJson(R"({"name": "pHoTo", "offset": 10, "limit": 50)" +
+                            std::string(descending ? R"(, "order": "desc"})" : "}")));
     // Counting stopped early: at least the page's end, never more than matched.
     EXPECT_FALSE(answer["data"]["total_exact"].asBool());
     EXPECT_GE(answer["data"]["total"].asInt(), 60) << "descending " << descending;
@@ -380,22 +348,13 @@ TEST_F(SearchEngineTest, SearchFiltersSortsAndPages) {
   }
   Ok(compound);
   Commit();
-  Json::Value q;
-  q["type"] = "image";
-  q["sort"] = "size";
-  q["order"] = "desc";
-  q["limit"] = 3;
-  q["offset"] = 1;
-  Json::Value answer = SearchFor(q);
+  const Json::Value answer = SearchFor(
+      ParseJson(R"({"type": "image", "sort": "size", "order": "desc", "limit": 3, "offset": 1})"));
   EXPECT_EQ(10, answer["data"]["total"].asInt());
   EXPECT_EQ((std::vector<std::string>{"/v/s/d0/f124.jpg", "/v/s/d1/f121.jpg", "/v/s/d0/f118.jpg"}),
             HitPaths(answer));
-  Json::Value ext;
-  ext["extension"] = "PDF";
-  ext["folder"] = "/v/s/d1";
-  ext["size_max"] = 100;
   EXPECT_EQ((std::vector<std::string>{"/v/s/d1/f101.pdf", "/v/s/d1/f107.pdf"}),
-            HitPaths(SearchFor(ext)));
+            Found(R"({"extension": "PDF", "folder": "/v/s/d1", "size_max": 100})"));
 }
 
 TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
@@ -429,8 +388,7 @@ TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
   for (const auto& c_ : cases) {
     Json::Value q;
     q["text"] = c_.query;
-    const Json::Value answer = SearchFor(q);
-    EXPECT_EQ(c_.paths, HitPaths(answer)) << c_.query;
+    EXPECT_EQ(c_.paths, HitPaths(SearchFor(q))) << c_.query;
   }
   for (const char* lazy : {"lazy", "laz*"}) {
     Json::Value q;
@@ -518,6 +476,8 @@ TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
   };
   Json::Value onto_system_file = Command("index_config_set", kId);
   onto_system_file["data"]["data"]["path"] = "/etc/passwd";
+  Json::Value size_one;
+  size_one["KALOMDFSSize"] = 1;
   const struct {
     const char* what;
     Json::Value request;
@@ -560,6 +520,7 @@ TEST_F(SearchEngineTest, BadRequestsGetClearErrors) {
       {"database up and out of a share",
        create_at(root_.Join("volume1/t/../../outside/@eaDir/@fileindex/db")), search::kBadArgument},
       {"moved onto a system file", onto_system_file, search::kBadArgument},
+      {"set of a missing document", SetById(kId, "/v/s/never", size_one), search::kNoSuchDocument},
   };
   for (const auto& c : cases) {
     EXPECT_EQ(c.code, ErrorCode(c.request)) << c.what << ": " << toString(c.request);
@@ -577,9 +538,7 @@ TEST_F(SearchEngineTest, APausedIndexAnswersReadsRefusesWritesAndSurvivesARestar
   Ok(Upsert(kId, FileDoc("/v/s/sent_before_pause")));
   Ok(Command("index_pause", kId));
   Restart();
-  Json::Value stats;
-  stats["command"] = "stats";
-  stats["data"] = Json::Value(Json::objectValue);
+  const Json::Value stats = Request("stats");
   Json::Value answer = Ok(stats);
   ASSERT_EQ(1u, answer["data"]["indexes"].size());
   EXPECT_EQ(kId, answer["data"]["indexes"][0]["id"].asString());
@@ -588,11 +547,9 @@ TEST_F(SearchEngineTest, APausedIndexAnswersReadsRefusesWritesAndSurvivesARestar
   const std::vector<std::string> both = {"/v/s/kept", "/v/s/sent_before_pause"};
   EXPECT_EQ(both, HitPaths(SearchName("")));
   EXPECT_EQ(both, DocPaths(GetByPrefix("/v/s/")));
-  Json::Value del = Command("document_del_by_id", kId);
-  del["data"]["doc_id"] = "/v/s/kept";
-  const Json::Value writes[] = {Upsert(kId, FileDoc("/v/s/new")),
-                                SetById(kId, "/v/s/kept", FileDoc("/v/s/moved")), del,
-                                PrefixQuery("document_del_by_query", kId, "/v/s/")};
+  const Json::Value writes[] = {
+      Upsert(kId, FileDoc("/v/s/new")), SetById(kId, "/v/s/kept", FileDoc("/v/s/moved")),
+      DelById(kId, "/v/s/kept"), PrefixQuery("document_del_by_query", kId, "/v/s/")};
   for (const Json::Value& write : writes) {
     EXPECT_EQ(search::kIndexPaused, ErrorCode(write)) << toString(write);
   }

@@ -1,5 +1,6 @@
 // The socket loop's bounds, driven round by round with RunOnce().
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <sys/resource.h>
 
 #include <algorithm>
@@ -24,7 +25,7 @@ TEST_F(SearchServerTest, ARequestOverTheMemoryBoundIsAnsweredBusyAfterItsBody) {
   CreateIndex();
   Json::Value big = Upsert(kId, FileDoc("/v/s/big"));
   big["data"]["data"]["KALOMDTextContent"] = std::string(8000, 'w');
-  FileDescriptor fd = ConnectRaw(SocketPath());
+  FileDescriptor fd = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(fd.get(), Framed(toString(big))));
   const Json::Value answer = ReadAnswer(fd.get());
   EXPECT_EQ(search::kBusy, answer["error"]["code"].asInt()) << toString(answer);
@@ -39,7 +40,7 @@ TEST_F(SearchServerTest, AFrameOverTheCapIsRefusedAndTheConnectionClosed) {
   search::ServerOptions options;
   options.max_frame = 1024;
   Restart(&options);
-  FileDescriptor fd = ConnectRaw(SocketPath());
+  FileDescriptor fd = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(fd.get(), LengthWord(1025)));
   EXPECT_EQ(search::kBadFrame, ReadAnswer(fd.get())["error"]["code"].asInt());
   EXPECT_TRUE(ClosedByDaemon(fd.get()));
@@ -56,10 +57,11 @@ TEST_F(SearchServerTest, AClientGoneMidAnswerIsDroppedAndOthersAreServed) {
   }
   Ok(compound);
   {
-    FileDescriptor leaving = ConnectRaw(SocketPath());
+    FileDescriptor leaving = ConnectUnix(SocketPath());
     ASSERT_TRUE(SendBytes(leaving.get(),
                           Framed(toString(PrefixQuery("document_get_by_query", kId, "/v/s/")))));
-    PumpUntilReadable(leaving.get());  // the answer has begun
+    pollfd begun = {leaving.get(), POLLIN, 0};  // the answer has begun
+    for (int i = 0; i < 100 && ::poll(&begun, 1, 0) != 1; ++i) server_->RunOnce(1000);
     EXPECT_GT(server_->held_bytes(), 0u);
   }  // closed with most of its answer unread
   Ok(Command("commit", kId));
@@ -74,9 +76,9 @@ TEST_F(SearchServerTest, ConnectionsOverTheCapWaitTheirTurn) {
   options.max_connections = 2;
   Restart(&options);
   CreateIndex();
-  FileDescriptor first = ConnectRaw(SocketPath());
-  FileDescriptor second = ConnectRaw(SocketPath());
-  FileDescriptor third = ConnectRaw(SocketPath());  // waits in the backlog
+  FileDescriptor first = ConnectUnix(SocketPath());
+  FileDescriptor second = ConnectUnix(SocketPath());
+  FileDescriptor third = ConnectUnix(SocketPath());  // waits in the backlog
   for (int i = 0; i < 5; ++i) server_->RunOnce(/*timeout_ms=*/0);
   EXPECT_EQ(2u, server_->connection_count());
   ASSERT_TRUE(SendBytes(third.get(), Framed(toString(Command("commit", kId)))));
@@ -89,8 +91,8 @@ TEST_F(SearchServerTest, SilentAndHalfSentConnectionsAreClosedAfterTheIdleTimeou
   search::ServerOptions options;
   options.now = [now] { return *now; };
   Restart(&options);
-  FileDescriptor silent = ConnectRaw(SocketPath());
-  FileDescriptor half = ConnectRaw(SocketPath());
+  FileDescriptor silent = ConnectUnix(SocketPath());
+  FileDescriptor half = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(half.get(), LengthWord(100) + "{"));
   for (int i = 0; i < 5 && server_->held_bytes() == 0; ++i) server_->RunOnce(0);
   EXPECT_EQ(2u, server_->connection_count());
@@ -118,9 +120,7 @@ TEST_F(SearchServerTest, AThousandClientsAtOnceAreAllAnswered) {
   Ok(Upsert(kId, FileDoc("/v/s/only.txt")));
   Ok(Command("commit", kId));
   const std::string request = Framed(R"({"command": "search", "data": {"name": "only"}})");
-  struct sockaddr_un address = {};
-  address.sun_family = AF_UNIX;
-  std::strncpy(address.sun_path, SocketPath().c_str(), sizeof(address.sun_path) - 1);
+  const sockaddr_un address = UnixAddress(SocketPath());
   enum class State { kConnecting, kWaiting, kAnswered };
   std::vector<State> states(kClients, State::kConnecting);
   std::vector<FileDescriptor> clients;
@@ -135,7 +135,7 @@ TEST_F(SearchServerTest, AThousandClientsAtOnceAreAllAnswered) {
       const int fd = clients[i].get();
       if (states[i] == State::kConnecting) {
         // A full backlog answers EAGAIN: the client tries again next round.
-        if (::connect(fd, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) != 0) {
+        if (::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
           ASSERT_EQ(EAGAIN, errno);
           continue;
         }
@@ -166,7 +166,7 @@ TEST_F(SearchServerTest, AThousandClientsAtOnceAreAllAnswered) {
 
 TEST_F(SearchServerTest, RequestStopFinishesAnswersAndDropsPartialRequests) {
   CreateIndex();
-  FileDescriptor partial = ConnectRaw(SocketPath());
+  FileDescriptor partial = ConnectUnix(SocketPath());
   ASSERT_TRUE(SendBytes(partial.get(), LengthWord(50) + "{"));
   for (int i = 0; i < 5 && server_->connection_count() < 1; ++i) server_->RunOnce(0);
   server_->RequestStop();

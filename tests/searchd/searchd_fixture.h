@@ -8,12 +8,11 @@
 
 #include <gtest/gtest.h>
 #include <json/json.h>
-#include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 
 #include <cstring>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -24,6 +23,7 @@
 #include "search/index_registry.h"
 #include "search/search_engine.h"
 #include "search/search_server.h"
+#include "support/framed_client.h"
 #include "support/temp_dir.h"
 
 namespace orvex {
@@ -33,29 +33,6 @@ inline Json::Value ParseJson(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(fromString(value, text)) << text;
   return value;
-}
-
-// A raw client socket, connected, for framing faults and slow clients.
-inline FileDescriptor ConnectRaw(const std::string& socket_path) {
-  FileDescriptor fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  struct sockaddr_un address = {};
-  address.sun_family = AF_UNIX;
-  std::strncpy(address.sun_path, socket_path.c_str(), sizeof(address.sun_path) - 1);
-  EXPECT_EQ(0, ::connect(fd.get(), reinterpret_cast<struct sockaddr*>(&address), sizeof(address)))
-      << socket_path << ": " << std::strerror(errno);
-  return fd;
-}
-
-inline std::string LengthWord(uint32_t length) {
-  return std::string(reinterpret_cast<const char*>(&length), sizeof(length));
-}
-
-inline std::string Framed(const std::string& text) {
-  return LengthWord(static_cast<uint32_t>(text.size() + 1)) + text + std::string(1, '\0');
-}
-
-inline bool SendBytes(int fd, const std::string& bytes) {
-  return ::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
 }
 
 // The commands the indexer sends, as the library's client builds them.
@@ -102,6 +79,20 @@ inline Json::Value SetById(const std::string& id, const std::string& doc_id,
   return req;
 }
 
+inline Json::Value DelById(const std::string& id, const std::string& doc_id) {
+  Json::Value req = Command("document_del_by_id", id);
+  req["data"]["doc_id"] = doc_id;
+  return req;
+}
+
+// A request of command whose data is the JSON text data.
+inline Json::Value Request(const std::string& command, const std::string& data = "{}") {
+  Json::Value req;
+  req["command"] = command;
+  req["data"] = ParseJson(data);
+  return req;
+}
+
 // The paths of a search answer's hits, in order.
 inline std::vector<std::string> HitPaths(const Json::Value& answer) {
   std::vector<std::string> paths;
@@ -138,46 +129,22 @@ class SearchdLoopTest : public ::testing::Test {
     return root_.Join("volume1/" + share + "/@eaDir/@fileindex/db");
   }
 
-  // Serves until fd has something to read (or is closed by the daemon).
-  void PumpUntilReadable(int fd) {
-    for (int round = 0; round < 10000; ++round) {
-      struct pollfd p = {fd, POLLIN, 0};
-      if (::poll(&p, 1, 0) == 1) return;
-      server_->RunOnce(/*timeout_ms=*/1000);
-    }
-    ADD_FAILURE() << "no answer";
-  }
-
   // Reads one framed answer from fd, serving meanwhile.
   Json::Value ReadAnswer(int fd) {
-    std::string bytes;
-    uint32_t length = 0;
-    for (;;) {
-      PumpUntilReadable(fd);
-      char chunk[65536];
-      const ssize_t n = ::recv(fd, chunk, sizeof(chunk), MSG_DONTWAIT);
-      if (n <= 0) break;
-      bytes.append(chunk, static_cast<size_t>(n));
-      if (bytes.size() >= 4) {
-        std::memcpy(&length, bytes.data(), 4);
-        if (bytes.size() >= 4 + length) break;
-      }
+    const std::optional<std::string> body = ReadFrame(fd, [this] { server_->RunOnce(1000); });
+    if (!body) {
+      ADD_FAILURE() << "connection closed without a whole answer";
+    } else {
+      EXPECT_EQ('\0', body->back()) << "answer without its NUL";
     }
-    if (bytes.size() < 4 || bytes.size() < 4 + length) {
-      ADD_FAILURE() << "connection closed without a whole answer (" << bytes.size() << " bytes)";
-      return Json::Value();
-    }
-    std::string body = bytes.substr(4, length);
-    EXPECT_EQ('\0', body.back()) << "answer without its NUL";
-    body.pop_back();
-    return ParseJson(body);
+    return BodyJson(body);
   }
 
   // Whether the daemon has closed fd (serving until it has, within bounds).
   bool ClosedByDaemon(int fd) {
-    PumpUntilReadable(fd);
     char byte;
-    return ::recv(fd, &byte, 1, MSG_DONTWAIT) == 0;
+    return !ReadFrame(fd, [this] { server_->RunOnce(1000); }) &&
+           ::recv(fd, &byte, 1, MSG_DONTWAIT) == 0;
   }
 
   // Sends all of bytes, serving while the socket is full: the loop runs on
@@ -199,7 +166,7 @@ class SearchdLoopTest : public ::testing::Test {
   }
 
   Json::Value Ask(const Json::Value& request) {
-    FileDescriptor fd = ConnectRaw(SocketPath());
+    FileDescriptor fd = ConnectUnix(SocketPath());
     EXPECT_TRUE(SendServing(fd.get(), Framed(toString(request))));
     return ReadAnswer(fd.get());
   }
@@ -236,6 +203,10 @@ class SearchdLoopTest : public ::testing::Test {
     req["command"] = "search";
     req["data"] = std::move(data);
     return Ok(req);
+  }
+  // The paths a search of the JSON text data finds.
+  std::vector<std::string> Found(const std::string& data) {
+    return HitPaths(SearchFor(ParseJson(data)));
   }
 
   Json::Value SearchName(const std::string& fragment, int limit = 1000) {

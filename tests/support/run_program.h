@@ -26,6 +26,11 @@ struct ProgramOutcome {
   long max_rss_kb = -1;  // the child's peak resident memory
 };
 
+// The path of a program of this build.
+inline std::string BuiltProgram(const std::string& name) {
+  return std::string(ORVEX_BUILD_DIR) + "/" + name;
+}
+
 inline std::string ReadFileText(const std::string& path) {
   std::ifstream in(path, std::ios::binary);
   std::ostringstream text;
