@@ -6,27 +6,24 @@
 
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstdint>
-#include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <future>
-#include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "indexd/indexd_test_root.h"
 #include "orvex/communication.h"
 #include "orvex/foundation/json.h"
 #include "orvex/foundation/system_hooks.h"
-#include "platform/share_test_root.h"
+#include "support/framed_client.h"
 #include "support/framed_peer.h"
 #include "support/log_capture.h"
 
@@ -39,20 +36,10 @@ using testing::FramedPeer;
 constexpr time_t kStart = 1700000000;
 constexpr int kMaxSteps = 2000;
 
-class IndexDaemonTest : public testing::ShareTestRoot {
+class IndexDaemonTest : public IndexdTestRoot {
  protected:
   IndexDaemonTest() {
-    root_ = AddShare("s");
-    docs_ = root_ + "/docs";
-    std::filesystem::create_directories(docs_);
-    std::filesystem::create_directories(root_ + "/@eaDir/@fileindex");
-    queue_ = root_ + "/@eaDir/@fileindex/queue";
-    peer_.SetResponder([](const Json::Value& request) -> FramedPeer::Reply {
-      // A rename lists the moved item's descendants: there are none here.
-      if (request["command"] == "document_get_by_query") return R"({"success":true,"data":[]})";
-      return std::string(FramedPeer::kSuccess);
-    });
-    WriteFolders(/*paused=*/false);
+    AnswerQueriesWith(Json::Value(Json::arrayValue));  // a rename's descendants: none here
   }
 
   SystemHooks FakeClock() {
@@ -64,61 +51,37 @@ class IndexDaemonTest : public testing::ShareTestRoot {
     return hooks;
   }
 
-  void WriteFolders(bool paused) {
-    std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
-    dir_.Write("var/packages/Orvex/etc/fileindex.folders",
-               std::string(R"([{"path": "/s/docs", "name": "docs", "document": false, )") +
-                   R"("audio": false, "video": false, "photo": false, "paused": )" +
-                   (paused ? "true" : "false") + "}]");
-  }
-
   void WriteStatus(const std::string& text) {
     std::filesystem::create_directories(dir_.Join("var/packages/Orvex/etc"));
     dir_.Write("var/packages/Orvex/etc/fileindex.status", text);
   }
 
-  std::string Touch(const std::string& rel) {
-    const std::string path = docs_ + "/" + rel;
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-    std::ofstream(path) << "x";
-    return path;
+  // The search daemon answers document_get_by_query with docs and every
+  // other request with success.
+  void AnswerQueriesWith(const Json::Value& docs) {
+    Json::Value answer;
+    answer["success"] = true;
+    answer["data"] = docs;
+    const std::string text = toString(answer);
+    peer_.SetResponder([text](const Json::Value& request) -> FramedPeer::Reply {
+      if (request["command"] == "document_get_by_query") return text;
+      return std::string(FramedPeer::kSuccess);
+    });
   }
 
-  static void Append(const std::string& file, const std::string& line) {
-    std::ofstream(file, std::ios::app) << line << "\n";
-  }
-  static std::string Line(unsigned event, const std::string& path, bool is_dir = false) {
-    return R"({"event": )" + std::to_string(event) + R"(, "is_dir": )" +
-           (is_dir ? "true" : "false") + R"(, "path": ")" + path + "\"}";
-  }
-  static std::string RenameLine(const std::string& from, const std::string& to) {
-    return R"({"event": 256, "is_dir": false, "path": ")" + to + R"(", "path_old": ")" + from +
-           "\"}";
+  // The document the index holds for path, as its last read left it.
+  static Json::Value Known(const std::string& path, const struct stat& st, long long size) {
+    Json::Value doc;
+    doc["KALOMDPath"] = path;
+    doc["KALOMDFSSize"] = static_cast<Json::Int64>(size);
+    doc["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
+    doc["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
+    return doc;
   }
 
-  void Start(WorkerOptions worker = Quick()) {
-    IndexDaemonOptions options;
-    options.server.socket_path = dir_.Join("var/run/fileindexd.sock");
-    options.worker = worker;
-    daemon_ = std::make_unique<IndexDaemon>(options);
-    std::string why;
-    ASSERT_TRUE(daemon_->Start(why)) << why;
-  }
-
-  static WorkerOptions Quick() {
-    WorkerOptions worker;
-    worker.quiet_ms = 0;
-    return worker;
-  }
-
-  // Steps the daemon until no queue file is left: every batch is committed
-  // and its snapshot deleted.
-  void Drain() {
-    for (int i = 0; i < kMaxSteps && (Exists(queue_) || Exists(queue_ + ".tmp")); ++i) {
-      daemon_->RunOnce(0);
-    }
-    ASSERT_FALSE(Exists(queue_ + ".tmp"));
-    ASSERT_FALSE(Exists(queue_));
+  // What a batch of changed files sends: their upserts, the directory's, a commit.
+  std::vector<std::string> Upserted(const std::string& file) const {
+    return {"document_upsert_by_id " + file, "document_upsert_by_id " + docs_, "commit"};
   }
 
   // Sends a command with the library's own client while the daemon steps.
@@ -133,44 +96,18 @@ class IndexDaemonTest : public testing::ShareTestRoot {
     sent.get();
   }
 
-  // One framed exchange on the daemon's socket, answer returned parsed.
+  // One framed exchange on the daemon's socket (body as given, its length
+  // word added), the answer parsed.
   Json::Value Exchange(const std::string& body) {
-    const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    const std::string path = dir_.Join("var/run/fileindexd.sock");
-    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-    const uint32_t length = static_cast<uint32_t>(body.size());
-    EXPECT_EQ(::write(fd, &length, sizeof(length)), 4);
-    EXPECT_EQ(::write(fd, body.data(), body.size()), static_cast<ssize_t>(body.size()));
-    std::string answer;
-    for (int i = 0; i < kMaxSteps; ++i) {
-      daemon_->RunOnce(0);
-      pollfd in{fd, POLLIN, 0};
-      if (::poll(&in, 1, 0) <= 0) continue;
-      char buf[4096];
-      const ssize_t n = ::read(fd, buf, sizeof(buf));
-      if (n <= 0) break;
-      answer.append(buf, static_cast<size_t>(n));
-      if (answer.size() >= 4) {
-        uint32_t want = 0;
-        std::memcpy(&want, answer.data(), 4);
-        if (answer.size() >= 4 + want) break;
-      }
-    }
-    ::close(fd);
-    Json::Value parsed;
-    if (answer.size() > 4) {
-      EXPECT_EQ(answer.back(), '\0');
-      EXPECT_TRUE(fromString(parsed, answer.substr(4, answer.size() - 5))) << answer;
-    }
-    return parsed;
+    const FileDescriptor fd = testing::ConnectUnix(socket_);
+    EXPECT_TRUE(testing::SendBytes(fd.get(), testing::LengthWord(body.size()) + body));
+    const std::optional<std::string> answer =
+        testing::ReadFrame(fd.get(), [this] { daemon_->RunOnce(0); });
+    EXPECT_TRUE(!answer || answer->back() == '\0');
+    return testing::BodyJson(answer);
   }
 
   static std::string Body(const std::string& json) { return json + std::string(1, '\0'); }
-
-  static bool Exists(const std::string& path) { return std::filesystem::exists(path); }
 
   // The requests with each compound one replaced by its sub-requests (an
   // empty one stays): the document commands in the order they take effect.
@@ -208,19 +145,17 @@ class IndexDaemonTest : public testing::ShareTestRoot {
   ScopedSystemHooks hooks_{FakeClock()};
   FramedPeer peer_{dir_.Join("var/run/kaloelasticd.sock")};
   testing::LogCapture log_;
-  std::string root_, docs_, queue_;
-  std::unique_ptr<IndexDaemon> daemon_;
 };
 
 TEST_F(IndexDaemonTest, QueueBecomesDocumentCommandsInOrderThenCommitAndSnapshotGoes) {
   const std::string a = Touch("a.bin"), b = Touch("b.bin"), c = Touch("c.bin");
   const std::string e = Touch("e.bin");
   const std::string d = docs_ + "/d.bin", f = docs_ + "/f.bin";
-  Append(queue_, Line(64, a));
-  Append(queue_, Line(64, b));
-  Append(queue_, Line(2, c));
-  Append(queue_, RenameLine(d, e));
-  Append(queue_, Line(128, f));
+  Queue(Line(64, a));
+  Queue(Line(64, b));
+  Queue(Line(2, c));
+  Queue(RenameLine(d, e));
+  Queue(Line(128, f));
   Start();
   Drain();
   EXPECT_EQ(Commands(),
@@ -237,8 +172,8 @@ TEST_F(IndexDaemonTest, QueueBecomesDocumentCommandsInOrderThenCommitAndSnapshot
 
 TEST_F(IndexDaemonTest, ChangesGoOutAsOneCompoundAndAnAttrOfAnUnknownDocumentBecomesAnUpsert) {
   const std::string a = Touch("a.bin"), b = Touch("b.bin");
-  Append(queue_, Line(4, a));  // attributes of a file the index never got
-  Append(queue_, Line(64, b));
+  Queue(Line(4, a));  // attributes of a file the index never got
+  Queue(Line(64, b));
   peer_.SetResponder([](const Json::Value& request) -> FramedPeer::Reply {
     if (!request.isMember("compound")) return std::string(FramedPeer::kSuccess);
     Json::Value answer;
@@ -266,14 +201,13 @@ TEST_F(IndexDaemonTest, ChangesGoOutAsOneCompoundAndAnAttrOfAnUnknownDocumentBec
 
 TEST_F(IndexDaemonTest, SnapshotOfAKilledRunIsProcessedBeforeTheLiveQueue) {
   const std::string a = Touch("a.bin"), b = Touch("b.bin");
-  Append(queue_ + ".tmp", Line(64, a));
-  Append(queue_, Line(64, b));
+  Queue(Line(64, a), ".tmp");
+  Queue(Line(64, b));
   Start();
   Drain();
-  EXPECT_EQ(Commands(),
-            (std::vector<std::string>{
-                "document_upsert_by_id " + a, "document_upsert_by_id " + docs_, "commit",
-                "document_upsert_by_id " + b, "document_upsert_by_id " + docs_, "commit"}));
+  std::vector<std::string> expected = Upserted(a);
+  for (const std::string& command : Upserted(b)) expected.push_back(command);
+  EXPECT_EQ(Commands(), expected);
 }
 
 TEST_F(IndexDaemonTest, ReindexWalksTheFolderAndUpsertsEveryFileAndDirectoryButNoMetadata) {
@@ -281,7 +215,7 @@ TEST_F(IndexDaemonTest, ReindexWalksTheFolderAndUpsertsEveryFileAndDirectoryButN
   Touch("@eaDir/thumb.jpg");
   Touch("sub/@eaDir/z.jpg");
   Touch("#recycle/old.bin");
-  Append(queue_, Line(0x10000, docs_));
+  Queue(Line(0x10000, docs_));
   Start();
   Drain();
   EXPECT_EQ(Commands(),
@@ -297,26 +231,11 @@ TEST_F(IndexDaemonTest, ReindexReadsOnlyChangedFilesAndDeletesDocumentsOfVanishe
   struct stat st;
   ASSERT_EQ(::lstat(same.c_str(), &st), 0);
   Json::Value known(Json::arrayValue);
-  const auto add = [&](const std::string& path, long long size) {
-    Json::Value doc;
-    doc["KALOMDPath"] = path;
-    doc["KALOMDFSSize"] = static_cast<Json::Int64>(size);
-    doc["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
-    doc["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
-    known.append(doc);
-  };
-  add(changed, st.st_size + 1);  // the file grew since it was indexed
-  add(gone, 1);
-  add(same, st.st_size);
-  Json::Value answer;
-  answer["success"] = true;
-  answer["data"] = known;
-  const std::string text = toString(answer);
-  peer_.SetResponder([text](const Json::Value& request) -> FramedPeer::Reply {
-    if (request["command"] == "document_get_by_query") return text;
-    return std::string(FramedPeer::kSuccess);
-  });
-  Append(queue_, Line(0x10000, docs_));
+  known.append(Known(changed, st, st.st_size + 1));  // the file grew since it was indexed
+  known.append(Known(gone, st, 1));
+  known.append(Known(same, st, st.st_size));
+  AnswerQueriesWith(known);
+  Queue(Line(0x10000, docs_));
   Start();
   Drain();
   EXPECT_EQ(Commands(),
@@ -329,18 +248,10 @@ TEST_F(IndexDaemonTest, ConfigurationChangeReadsEveryFileAgain) {
   const std::string a = Touch("a.bin");
   struct stat st;
   ASSERT_EQ(::lstat(a.c_str(), &st), 0);
-  Json::Value answer;
-  answer["success"] = true;
-  answer["data"][0]["KALOMDPath"] = a;
-  answer["data"][0]["KALOMDFSSize"] = static_cast<Json::Int64>(st.st_size);
-  answer["data"][0]["KALOMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctim.tv_sec);
-  answer["data"][0]["KALOMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtim.tv_sec);
-  const std::string text = toString(answer);
-  peer_.SetResponder([text](const Json::Value& request) -> FramedPeer::Reply {
-    if (request["command"] == "document_get_by_query") return text;
-    return std::string(FramedPeer::kSuccess);
-  });
-  Append(queue_, R"({"event": 131072, "path": ")" + docs_ + R"(", "data": {"document": true}})");
+  Json::Value known(Json::arrayValue);
+  known.append(Known(a, st, st.st_size));
+  AnswerQueriesWith(known);
+  Queue(R"({"event": 131072, "path": ")" + docs_ + R"(", "data": {"document": true}})");
   Start();
   Drain();
   EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + docs_ + "/",
@@ -355,32 +266,31 @@ TEST_F(IndexDaemonTest, QueueIsTakenWhenQuietOrAfterTheLongestWaitOfASteadyStrea
   worker.clock_ms = [this] { return int64_t{now_} * 1000; };
   Start(worker);
   const std::string a = Touch("a.bin");
-  Append(queue_, Line(2, a));
+  Queue(Line(2, a));
   daemon_->RunOnce(0);
   now_ += 4;
   daemon_->RunOnce(0);
   EXPECT_TRUE(peer_.requests().empty());  // not yet quiet for long enough
   now_ += 1;
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
-                                                  "document_upsert_by_id " + docs_, "commit"}));
+  EXPECT_EQ(Commands(), Upserted(a));
 
   // A line every few seconds: never quiet, yet taken once the first has waited 30 s.
   for (int second = 0; second < 30; second += 3) {
-    Append(queue_, Line(2, a));
+    Queue(Line(2, a));
     daemon_->RunOnce(0);
     EXPECT_EQ(Commands().size(), 3u) << "taken early, at second " << second;
     now_ += 3;
   }
-  Append(queue_, Line(2, a));
+  Queue(Line(2, a));
   Drain();
   EXPECT_EQ(Commands().size(), 6u);
 }
 
 TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
   const std::string a = Touch("a.bin"), b = Touch("b.bin");
-  Append(queue_, Line(64, a));
-  Append(queue_, Line(64, b));
+  Queue(Line(64, a));
+  Queue(Line(64, b));
   peer_.Stop();
   Start();
   for (int i = 0; i < 20; ++i) daemon_->RunOnce(0);
@@ -399,8 +309,8 @@ TEST_F(IndexDaemonTest, ASearchDaemonThatIsAwayIsRetriedWithoutLosingTheBatch) {
 TEST_F(IndexDaemonTest, WhatAFailedCommitMayHaveLostIsSentAgainAndANeverIndexedSourceIsSkipped) {
   const std::string a = Touch("a.bin"), b = Touch("b.bin");
   const std::string lock = docs_ + "/b.lock";  // made and renamed before it was indexed
-  Append(queue_, Line(64, a));
-  Append(queue_, RenameLine(lock, b));
+  Queue(Line(64, a));
+  Queue(RenameLine(lock, b));
   std::atomic<bool> refused{false};
   peer_.SetResponder([&](const Json::Value& request) -> FramedPeer::Reply {
     if (request["command"] == "document_set_by_id" && request["data"]["doc_id"] == lock) {
@@ -429,12 +339,12 @@ TEST_F(IndexDaemonTest, WhatAFailedCommitMayHaveLostIsSentAgainAndANeverIndexedS
 
 TEST_F(IndexDaemonTest, CrashMarkWalksEveryIndexedFolderOfTheShareInstead) {
   const std::string a = Touch("a.bin");
-  Append(queue_, Line(64, a));
-  Append(queue_, Line(0x200, root_));
-  Append(queue_, Line(128, docs_ + "/never-looked-at.bin"));
+  Queue(Line(64, a));
+  Queue(Line(0x200, share_));
+  Queue(Line(128, docs_ + "/never-looked-at.bin"));
   Start();
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + root_ + "/",
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + share_ + "/",
                                                   "document_upsert_by_id " + docs_,
                                                   "document_upsert_by_id " + a, "commit"}));
 }
@@ -442,18 +352,17 @@ TEST_F(IndexDaemonTest, CrashMarkWalksEveryIndexedFolderOfTheShareInstead) {
 TEST_F(IndexDaemonTest, EventsInMetadataFoldersNeverBecomeDocuments) {
   const std::string thumb = Touch("@eaDir/t.jpg");
   const std::string kept = Touch("k.bin");
-  Append(queue_, Line(64, thumb));
-  Append(queue_, Line(64, kept));
+  Queue(Line(64, thumb));
+  Queue(Line(64, kept));
   Start();
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + kept,
-                                                  "document_upsert_by_id " + docs_, "commit"}));
+  EXPECT_EQ(Commands(), Upserted(kept));
 }
 
 TEST_F(IndexDaemonTest, NothingIsSentWhilePausedUntilTheResumeTimeComes) {
   WriteStatus(R"({"resume_time": )" + std::to_string(kStart + 3600) + "}");
   const std::string a = Touch("a.bin");
-  Append(queue_, Line(64, a));
+  Queue(Line(64, a));
   Start();
   for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
   EXPECT_TRUE(peer_.requests().empty());
@@ -461,8 +370,7 @@ TEST_F(IndexDaemonTest, NothingIsSentWhilePausedUntilTheResumeTimeComes) {
   EXPECT_EQ(daemon_->Status()["paused"], true);
   now_ = kStart + 3600;
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
-                                                  "document_upsert_by_id " + docs_, "commit"}));
+  EXPECT_EQ(Commands(), Upserted(a));
   EXPECT_EQ(daemon_->Status()["paused"], false);
 }
 
@@ -472,13 +380,12 @@ TEST_F(IndexDaemonTest, PauseAndResumeCommandsHoldAndReleaseTheWorkers) {
   pause["resume_time"] = 0;
   Command("pause", pause);
   const std::string a = Touch("a.bin");
-  Append(queue_, Line(64, a));
+  Queue(Line(64, a));
   for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
   EXPECT_TRUE(peer_.requests().empty());
   Command("resume", Json::nullValue);
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
-                                                  "document_upsert_by_id " + docs_, "commit"}));
+  EXPECT_EQ(Commands(), Upserted(a));
 }
 
 TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
@@ -490,14 +397,13 @@ TEST_F(IndexDaemonTest, WorkerCreateAndDeleteOverTheDaemonSocket) {
   Command("worker_create", share);
   EXPECT_TRUE(daemon_->HasWorker("s"));
   const std::string a = Touch("a.bin");
-  Append(queue_, Line(64, a));
+  Queue(Line(64, a));
   Drain();
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_upsert_by_id " + a,
-                                                  "document_upsert_by_id " + docs_, "commit"}));
+  EXPECT_EQ(Commands(), Upserted(a));
 
   Command("worker_delete", share);
   EXPECT_FALSE(daemon_->HasWorker("s"));
-  Append(queue_, Line(64, a));
+  Queue(Line(64, a));
   for (int i = 0; i < 50; ++i) daemon_->RunOnce(0);
   EXPECT_EQ(Commands().size(), 3u);
   EXPECT_TRUE(Exists(queue_));
@@ -535,7 +441,7 @@ TEST_F(IndexDaemonTest, StatusAnswersPerShareProgressAndPauseState) {
 TEST_F(IndexDaemonTest, BadFramesAreRefusedAndTheSocketIsGroupOnly) {
   Start();
   struct stat st;
-  ASSERT_EQ(::stat(dir_.Join("var/run/fileindexd.sock").c_str(), &st), 0);
+  ASSERT_EQ(::stat(socket_.c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 0777, 0660u);
   EXPECT_EQ(Exchange(R"({"type": "status"})")["error"]["msg"], "request without its NUL");
   EXPECT_EQ(Exchange(Body(R"({"type": "dance"})"))["error"]["code"], 120);
@@ -548,25 +454,18 @@ TEST_F(IndexDaemonTest, OversizedFramesAndConnectionsPastTheCapAreRefused) {
   huge.back() = '\0';
   EXPECT_EQ(Exchange(huge)["error"]["msg"], "bad frame length");
 
-  std::vector<int> held;
+  std::vector<FileDescriptor> held;
   for (int i = 0; i < 17; ++i) {
-    const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    const std::string path = dir_.Join("var/run/fileindexd.sock");
-    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    ASSERT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-    held.push_back(fd);
+    held.push_back(testing::ConnectUnix(socket_));
     daemon_->RunOnce(0);
   }
   // The seventeenth is closed at once: it reads the end of the stream.
-  pollfd last{held.back(), POLLIN, 0};
+  pollfd last{held.back().get(), POLLIN, 0};
   ASSERT_EQ(::poll(&last, 1, 5000), 1);
   char byte = 0;
-  EXPECT_EQ(::read(held.back(), &byte, 1), 0);
-  pollfd first{held.front(), POLLIN, 0};
+  EXPECT_EQ(::read(held.back().get(), &byte, 1), 0);
+  pollfd first{held.front().get(), POLLIN, 0};
   EXPECT_EQ(::poll(&first, 1, 0), 0);  // the others stay open
-  for (const int fd : held) ::close(fd);
 }
 
 TEST_F(IndexDaemonTest, NeedReindexFlagAtStartWalksTheShareAndIsCleared) {
@@ -576,7 +475,7 @@ TEST_F(IndexDaemonTest, NeedReindexFlagAtStartWalksTheShareAndIsCleared) {
   for (int i = 0; i < kMaxSteps && (Commands().empty() || Commands().back() != "commit"); ++i) {
     daemon_->RunOnce(0);
   }
-  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + root_ + "/",
+  EXPECT_EQ(Commands(), (std::vector<std::string>{"document_get_by_query " + share_ + "/",
                                                   "document_upsert_by_id " + docs_,
                                                   "document_upsert_by_id " + x, "commit"}));
   Json::Value status;
