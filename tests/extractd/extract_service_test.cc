@@ -8,16 +8,16 @@
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cstring>
 #include <memory>
-#include <sstream>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "orvex/portable/file_descriptor.h"
+#include "support/framed_client.h"
 #include "support/sanitizer.h"
 #include "support/temp_dir.h"
 
@@ -83,79 +83,35 @@ class ExtractServiceTest : public ::testing::Test {
     ASSERT_TRUE(service_->Start()) << std::strerror(errno);
   }
 
-  FileDescriptor Connect() {
-    FileDescriptor fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    struct sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    const std::string path = dir_.Join("run/extract.sock");
-    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    EXPECT_EQ(0,
-              ::connect(fd.get(), reinterpret_cast<struct sockaddr*>(&address), sizeof(address)));
-    return fd;
-  }
+  FileDescriptor Connect() { return testing::ConnectUnix(dir_.Join("run/extract.sock")); }
 
   static void SendRaw(const FileDescriptor& fd, const std::string& bytes) {
-    ASSERT_EQ(static_cast<ssize_t>(bytes.size()),
-              ::send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL));
+    ASSERT_TRUE(testing::SendBytes(fd.get(), bytes));
   }
 
-  static std::string Framed(const std::string& text) {
-    const uint32_t length = static_cast<uint32_t>(text.size() + 1);
-    std::string frame(reinterpret_cast<const char*>(&length), sizeof(length));
-    return frame + text + std::string(1, '\0');
-  }
-
-  // Steps the service until fd has something to read (or is closed), then
-  // reads one message; empty when the service closed the connection instead.
-  std::string ReceiveBody(const FileDescriptor& fd) {
-    struct pollfd pfd = {fd.get(), POLLIN, 0};
-    for (int round = 0; round < 1000 && ::poll(&pfd, 1, 0) == 0; ++round) {
-      service_->RunOnce(50);
+  // One answer's body without its final NUL, stepping the service while it
+  // comes; nullopt when the service closed the connection instead.
+  std::optional<std::string> ReceiveBody(const FileDescriptor& fd) {
+    std::optional<std::string> body =
+        testing::ReadFrame(fd.get(), [this] { service_->RunOnce(50); });
+    char byte;
+    if (!body) {
+      EXPECT_EQ(0, ::recv(fd.get(), &byte, 1, MSG_DONTWAIT)) << "no answer, yet not closed";
+    } else if (!body->empty() && body->back() == '\0') {
+      body->pop_back();
     }
-    if (::poll(&pfd, 1, 0) == 0) {  // never block the suite on a lost answer
-      ADD_FAILURE() << "no answer after 1000 steps of the service";
-      return std::string();
-    }
-    uint32_t length = 0;
-    if (::recv(fd.get(), &length, sizeof(length), MSG_WAITALL) != sizeof(length)) {
-      return std::string();
-    }
-    std::string body(length, '\0');
-    // A long answer arrives as the service writes it: keep stepping it.
-    for (size_t done = 0; done < length;) {
-      const ssize_t n = ::recv(fd.get(), &body[done], length - done, MSG_DONTWAIT);
-      if (n > 0) {
-        done += static_cast<size_t>(n);
-      } else if (n == 0) {
-        ADD_FAILURE() << "the answer was cut short";
-        return std::string();
-      } else {
-        service_->RunOnce(50);
-      }
-    }
-    if (!body.empty() && body.back() == '\0') body.pop_back();
     return body;
   }
 
   // One answer's JSON text (up to the NUL that a text may follow), parsed;
   // null when the service closed the connection instead.
-  Json::Value Receive(const FileDescriptor& fd) {
-    const std::string body = ReceiveBody(fd);
-    if (body.empty()) return Json::Value();
-    Json::Value answer;
-    Json::CharReaderBuilder builder;
-    std::string errors;
-    std::istringstream in(body.substr(0, body.find('\0')));
-    EXPECT_TRUE(Json::parseFromStream(builder, in, &answer, &errors)) << body;
-    return answer;
-  }
+  Json::Value Receive(const FileDescriptor& fd) { return testing::BodyJson(ReceiveBody(fd)); }
 
   Json::Value Ask(const std::string& path) {
     const FileDescriptor fd = Connect();
     Json::Value request;
     request["path"] = path;
-    Json::StreamWriterBuilder builder;
-    SendRaw(fd, Framed(Json::writeString(builder, request)));
+    SendRaw(fd, testing::Framed(Json::writeString(Json::StreamWriterBuilder(), request)));
     return Receive(fd);
   }
 
@@ -178,31 +134,27 @@ class ExtractServiceTest : public ::testing::Test {
   std::unique_ptr<ExtractService> service_;
 };
 
-TEST_F(ExtractServiceTest, SocketIsCreatedMode0660) {
-  struct stat st;
-  ASSERT_EQ(0, ::stat(dir_.Join("run/extract.sock").c_str(), &st));
-  EXPECT_TRUE(S_ISSOCK(st.st_mode));
-  EXPECT_EQ(0660u, st.st_mode & 07777);
-}
-
-TEST_F(ExtractServiceTest, AnswersWithTheParsersProperties) {
+// A file the parser read gives its properties; a corrupt one what was read
+// and why, but no fault.
+TEST_F(ExtractServiceTest, AnswersWithTheParsersPropertiesAndProblem) {
   const Json::Value answer = Ask(File("report.txt"));
   EXPECT_TRUE(answer["ok"].asBool()) << answer;
   EXPECT_EQ("report.txt", answer["data"]["KALOMDTitle"].asString());
   EXPECT_FALSE(answer.isMember("fault"));
+  const Json::Value corrupt = Ask(File("x.bad"));
+  EXPECT_FALSE(corrupt["ok"].asBool());
+  EXPECT_EQ("partial", corrupt["data"]["KALOMDTitle"].asString());
+  EXPECT_EQ("test parser: corrupt", corrupt["reason"].asString());
+  EXPECT_FALSE(corrupt.isMember("fault"));
 }
 
 TEST_F(ExtractServiceTest, TextFollowsTheAnswersJsonTextAsItsOwnBytes) {
   const FileDescriptor fd = Connect();
-  SendRaw(fd, Framed("{\"path\": \"" + File("long.text") + "\"}"));
-  const std::string body = ReceiveBody(fd);
+  SendRaw(fd, testing::Framed("{\"path\": \"" + File("long.text") + "\"}"));
+  const std::string body = ReceiveBody(fd).value_or("");
   const size_t nul = body.find('\0');
   ASSERT_NE(std::string::npos, nul) << body;
-  Json::Value answer;
-  Json::CharReaderBuilder builder;
-  std::string errors;
-  std::istringstream in(body.substr(0, nul));
-  ASSERT_TRUE(Json::parseFromStream(builder, in, &answer, &errors)) << body;
+  const Json::Value answer = testing::BodyJson(body);
   EXPECT_TRUE(answer["ok"].asBool()) << answer;
   EXPECT_EQ("with text", answer["data"]["KALOMDTitle"].asString());
   EXPECT_FALSE(answer["data"].isMember("KALOMDTextContent"));
@@ -210,17 +162,9 @@ TEST_F(ExtractServiceTest, TextFollowsTheAnswersJsonTextAsItsOwnBytes) {
   EXPECT_EQ(text.size(), answer["text_bytes"].asUInt64());
   EXPECT_EQ(text, body.substr(nul + 1));
   // The same connection carries the next request, without a text.
-  SendRaw(fd, Framed("{\"path\": \"" + File("next.txt") + "\"}"));
-  const std::string next = ReceiveBody(fd);
+  SendRaw(fd, testing::Framed("{\"path\": \"" + File("next.txt") + "\"}"));
+  const std::string next = ReceiveBody(fd).value_or("");
   EXPECT_EQ(std::string::npos, next.find('\0')) << next;
-}
-
-TEST_F(ExtractServiceTest, CorruptFileGivesWhatWasReadAndNoFault) {
-  const Json::Value answer = Ask(File("x.bad"));
-  EXPECT_FALSE(answer["ok"].asBool());
-  EXPECT_EQ("partial", answer["data"]["KALOMDTitle"].asString());
-  EXPECT_EQ("test parser: corrupt", answer["reason"].asString());
-  EXPECT_FALSE(answer.isMember("fault"));
 }
 
 // A crash, an endless loop and an endless allocation each cost one worker,
@@ -264,19 +208,19 @@ TEST_F(ExtractServiceTest, NonRegularFilesAreRefusedUnopened) {
 
 TEST_F(ExtractServiceTest, GarbageGetsAnErrorAndTheConnectionStaysUsable) {
   const FileDescriptor fd = Connect();
-  SendRaw(fd, Framed("this is not json"));
+  SendRaw(fd, testing::Framed("this is not json"));
   const Json::Value answer = Receive(fd);
   EXPECT_FALSE(answer["ok"].asBool());
   EXPECT_EQ(0u, answer["reason"].asString().rfind("bad request", 0)) << answer;
-  SendRaw(fd, Framed("{\"path\": \"" + File("ok.txt") + "\"}"));
+  SendRaw(fd, testing::Framed("{\"path\": \"" + File("ok.txt") + "\"}"));
   EXPECT_EQ("ok.txt", Receive(fd)["data"]["KALOMDTitle"].asString());
 }
 
 TEST_F(ExtractServiceTest, RequestsSentTogetherAreAnsweredOneByOneInOrder) {
   const FileDescriptor fd = Connect();
   std::string burst;
-  for (int i = 0; i < 200; ++i) burst += Framed("not json " + std::to_string(i));
-  burst += Framed("{\"path\": \"" + File("last.txt") + "\"}");
+  for (int i = 0; i < 200; ++i) burst += testing::Framed("not json " + std::to_string(i));
+  burst += testing::Framed("{\"path\": \"" + File("last.txt") + "\"}");
   SendRaw(fd, burst);
   for (int i = 0; i < 200; ++i) {
     EXPECT_EQ(0u, Receive(fd)["reason"].asString().rfind("bad request", 0)) << i;
@@ -304,7 +248,7 @@ TEST_F(ExtractServiceTest, StalledClientIsDroppedAndDoesNotDelayOthers) {
 TEST_F(ExtractServiceTest, ClientThatLeavesBeforeItsAnswerCostsNothing) {
   {
     const FileDescriptor gone = Connect();
-    SendRaw(gone, Framed("{\"path\": \"" + File("slow.hang") + "\"}"));
+    SendRaw(gone, testing::Framed("{\"path\": \"" + File("slow.hang") + "\"}"));
     for (int round = 0; round < 3; ++round) service_->RunOnce(0);  // accept, read, dispatch
   }
   // Whether the abandoned file reached the only worker depends on how fast
@@ -326,7 +270,11 @@ TEST_F(ExtractServiceTest, SecondDaemonOnTheSameSocketIsRefused) {
   EXPECT_TRUE(Ask(File("still.txt"))["ok"].asBool());
 }
 
-TEST_F(ExtractServiceTest, StopRemovesTheSocketAndTheWorkers) {
+TEST_F(ExtractServiceTest, TheSocketIsMode0660UntilStopRemovesItAndTheWorkers) {
+  struct stat st;
+  ASSERT_EQ(0, ::stat(dir_.Join("run/extract.sock").c_str(), &st));
+  EXPECT_TRUE(S_ISSOCK(st.st_mode));
+  EXPECT_EQ(0660u, st.st_mode & 07777);
   ASSERT_EQ(1u, service_->live_workers());
   service_->Stop();
   EXPECT_EQ(0u, service_->live_workers());
