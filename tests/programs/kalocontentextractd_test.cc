@@ -3,22 +3,16 @@
 // on its socket against misbehaving clients, its clean stop on SIGTERM; and
 // `orvex extract` on top of it.
 #include <gtest/gtest.h>
-#include <poll.h>
-#include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
-#include <sys/un.h>
 #include <unistd.h>
 
-#include <cstring>
 #include <filesystem>
 #include <string>
 #include <vector>
 
-#include "kalo/kalo_sock.h"
 #include "orvex/portable/extract_protocol.h"
-#include "orvex/portable/file_descriptor.h"
+#include "support/framed_client.h"
 #include "support/program_test.h"
 #include "support/sanitizer.h"
 
@@ -29,45 +23,26 @@ namespace {
 class KalocontentextractdTest : public ProgramTest {
  protected:
   KalocontentextractdTest() : ProgramTest("kalocontentextractd") {}
-  void TearDown() override {
-    if (daemon_pid_ > 0) StopDaemon();
-  }
 
   ProgramOutcome RunWithFaults(const std::vector<std::string>& args) {
-    return RunProgram(program_, args, {"ORVEX_ROOT=" + root_.path(), "ORVEX_EXTRACT_FAULTS=1"},
-                      io_.path());
+    return RunIn(program_, args, {"ORVEX_EXTRACT_FAULTS=1"});
   }
   std::string SocketPath() const { return root_.Join("var/run/kalocontentextractd.sock"); }
 
-  // Detached: the command returns once the socket is ready.
   void StartDaemon() {
-    const ProgramOutcome started =
-        RunWithFaults({"--workers", "1", "--deadline-ms", "300", "--memory-mb", "64"});
-    ASSERT_EQ(0, started.status) << started.err;
-    daemon_pid_ = std::stoi(ReadFileText(root_.Join("var/run/kalocontentextractd.pid")));
-  }
-  // SIGTERM, then wait for the daemon (not our child) to be gone.
-  void StopDaemon() {
-    const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, daemon_pid_, 0));
-    ASSERT_GE(pidfd, 0);
-    ASSERT_EQ(0, ::kill(daemon_pid_, SIGTERM));
-    struct pollfd pfd = {pidfd, POLLIN, 0};
-    EXPECT_EQ(1, ::poll(&pfd, 1, 10000));
-    ::close(pidfd);
-    daemon_pid_ = -1;
+    StartDetached(daemon_, "kalocontentextractd",
+                  {"--workers", "1", "--deadline-ms", "300", "--memory-mb", "64"},
+                  {"ORVEX_EXTRACT_FAULTS=1"});
   }
 
   Json::Value Ask(const std::string& path) {
-    kalodaemon::DomainSockConnection connection(SocketPath());
-    EXPECT_TRUE(connection.Connect()) << std::strerror(errno);
-    Json::Value request;
-    request["path"] = path;
-    EXPECT_TRUE(connection.Send(toString(request)));
-    std::string message;
-    EXPECT_TRUE(connection.Recv(message));
+    const FileDescriptor fd = SendRaw(Framed(R"({"path": ")" + path + "\"}"));
+    std::string message = ReadFrame(fd.get()).value_or("");
+    EXPECT_FALSE(message.empty()) << path;
+    if (!message.empty()) message.pop_back();  // the NUL that ends every message
     // A text travels after the JSON text's NUL, announced by "text_bytes".
+    Json::Value answer = BodyJson(message);
     const size_t nul = message.find('\0');
-    Json::Value answer = Parse(message.substr(0, nul));
     if (nul != std::string::npos) {
       EXPECT_EQ(message.size() - nul - 1, answer["text_bytes"].asUInt64()) << message;
       answer["data"][orvex::portable::kExtractTextMember] = message.substr(nul + 1);
@@ -77,18 +52,12 @@ class KalocontentextractdTest : public ProgramTest {
 
   // Raw bytes on a fresh connection, left open.
   FileDescriptor SendRaw(const std::string& bytes) {
-    FileDescriptor fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    struct sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, SocketPath().c_str(), sizeof(address.sun_path) - 1);
-    EXPECT_EQ(0,
-              ::connect(fd.get(), reinterpret_cast<struct sockaddr*>(&address), sizeof(address)));
-    EXPECT_EQ(static_cast<ssize_t>(bytes.size()),
-              ::send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL));
+    FileDescriptor fd = ConnectUnix(SocketPath());
+    EXPECT_TRUE(SendBytes(fd.get(), bytes));
     return fd;
   }
 
-  pid_t daemon_pid_ = -1;
+  DaemonProcess daemon_;
 };
 
 TEST_F(KalocontentextractdTest, OneShotPrintsTheMetadataObject) {
@@ -125,9 +94,9 @@ TEST_F(KalocontentextractdTest, DaemonAnswersOnA0660SocketAndStopsCleanlyOnSigte
   ASSERT_EQ(0, ::stat(SocketPath().c_str(), &st));
   EXPECT_EQ(0660u, st.st_mode & 07777);
   EXPECT_TRUE(Ask(Write("files/ok.txt", "text"))["ok"].asBool());
-  StopDaemon();
+  EXPECT_EQ(0, daemon_.Stop());
   EXPECT_NE(0, ::access(SocketPath().c_str(), F_OK));
-  EXPECT_NE(0, ::access(root_.Join("var/run/kalocontentextractd.pid").c_str(), F_OK));
+  EXPECT_NE(0, ::access(PidFile("kalocontentextractd").c_str(), F_OK));
 }
 
 TEST_F(KalocontentextractdTest, DaemonSurvivesGarbageHugeLengthsAndFaultyFiles) {
@@ -150,14 +119,13 @@ TEST_F(KalocontentextractdTest, DaemonSurvivesGarbageHugeLengthsAndFaultyFiles) 
 }
 
 TEST_F(KalocontentextractdTest, OrvexExtractPrintsAttributesAndMetadata) {
-  const std::string orvex_tool = std::string(ORVEX_BUILD_DIR) + "/orvex";
+  const std::string orvex_tool = BuiltProgram("orvex");
   std::filesystem::create_directories(root_.Join("usr/kalo/bin"));
   std::filesystem::create_symlink(program_, root_.Join("usr/kalo/bin/kalocontentextractd"));
   const std::string good = Write("files/report.txt", "hello");
   const std::string bad = Write("files/report.crash", "boom");
   const ProgramOutcome run =
-      RunProgram(orvex_tool, {"extract", good, bad, "--meta", "--json"},
-                 {"ORVEX_ROOT=" + root_.path(), "ORVEX_EXTRACT_FAULTS=1"}, io_.path());
+      RunIn(orvex_tool, {"extract", good, bad, "--meta", "--json"}, {"ORVEX_EXTRACT_FAULTS=1"});
   ASSERT_EQ(0, run.status) << run.err;
   const Json::Value files = Parse(run.out);
   ASSERT_EQ(2u, files.size());
@@ -168,8 +136,7 @@ TEST_F(KalocontentextractdTest, OrvexExtractPrintsAttributesAndMetadata) {
   EXPECT_TRUE(record["files"].isMember(bad));
   EXPECT_FALSE(record["files"].isMember(good));
 
-  const ProgramOutcome text = RunProgram(orvex_tool, {"extract", root_.Join("files/missing")},
-                                         {"ORVEX_ROOT=" + root_.path()}, io_.path());
+  const ProgramOutcome text = RunIn(orvex_tool, {"extract", root_.Join("files/missing")});
   EXPECT_EQ(2, text.status);
   EXPECT_NE(std::string::npos, text.err.find("orvex: error 914: cannot examine")) << text.err;
 }

@@ -14,6 +14,7 @@
 #include <sstream>
 
 #include "orvex/version.h"
+#include "support/framed_client.h"
 #include "support/framed_peer.h"
 #include "support/program_test.h"
 
@@ -67,14 +68,9 @@ class OrvexCliTest : public ProgramTest {
   // A socket file that nothing listens on, as a daemon that died leaves it.
   void MakeStaleSocket(const std::string& path) {
     fs::create_directories(fs::path(path).parent_path());
-    const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
-    ASSERT_LE(0, fd);
-    struct sockaddr_un address;
-    std::memset(&address, 0, sizeof(address));
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    EXPECT_EQ(0, ::bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)));
-    ::close(fd);
+    const FileDescriptor fd(::socket(AF_UNIX, SOCK_STREAM, 0));
+    const sockaddr_un address = UnixAddress(path);
+    EXPECT_EQ(0, ::bind(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)));
   }
 };
 
@@ -202,21 +198,15 @@ TEST_F(OrvexCliTest, EveryBadCommandLineGetsItsOwnMessageAndStatus2ChangingNothi
 }
 
 TEST_F(OrvexCliTest, EveryCommandHasHelpAndTheToolAVersion) {
-  const std::vector<std::vector<std::string>> helps = {{"--help"},
-                                                       {"share", "--help"},
-                                                       {"share", "add", "--help"},
-                                                       {"share", "list", "--help"},
-                                                       {"share", "remove", "--help"},
-                                                       {"status", "--help"},
-                                                       {"pause", "--help"},
-                                                       {"resume", "--help"},
-                                                       {"folder", "--help"},
-                                                       {"folder", "list", "--help"},
-                                                       {"folder", "get", "--help"},
-                                                       {"pause", "5", "--help"}};
-  for (const auto& args : helps) {
+  for (const std::string line :
+       {"--help", "share --help", "share add --help", "share list --help", "share remove --help",
+        "status --help", "pause --help", "resume --help", "folder --help", "folder list --help",
+        "folder get --help", "pause 5 --help"}) {
+    std::vector<std::string> args;
+    std::istringstream words(line);
+    for (std::string word; words >> word;) args.push_back(word);
     const ProgramOutcome help = Run(args);
-    EXPECT_EQ(0, help.status) << args.size();
+    EXPECT_EQ(0, help.status) << line;
     EXPECT_EQ(0u, help.out.find("usage: orvex " + (args[0] == "--help" ? "" : args[0])))
         << help.out;
     EXPECT_EQ("", help.err);

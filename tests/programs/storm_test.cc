@@ -18,7 +18,6 @@
 #include <functional>
 #include <map>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "orvex/foundation/json.h"
@@ -150,18 +149,10 @@ class StormTest : public ProgramTest {
     ASSERT_EQ(0, index.status) << index.out << index.err;
   }
 
-  // One framed request to the daemon serving socket (under the root); its
-  // answer, null when it does not answer.
-  Json::Value Ask(const std::string& socket, const Json::Value& request) {
-    return AskDaemon(root_.Join(socket), request);
-  }
-
   // The indexing daemon's status of the share; null when it does not answer.
   Json::Value ShareStatus() {
-    Json::Value request;
-    request["type"] = "status";
-    request["data"] = Json::Value();
-    return Ask("var/run/fileindexd.sock", request)["data"]["shares"]["tree"];
+    return AskDaemon(root_.Join("var/run/fileindexd.sock"),
+                     Parse(R"({"type": "status", "data": null})"))["data"]["shares"]["tree"];
   }
 
   // The documents whose path begins with prefix.
@@ -170,7 +161,7 @@ class StormTest : public ProgramTest {
     request["command"] = "document_get_by_query";
     request["data"]["id"] = "fileindex_tree";
     request["data"]["query"]["qsl"]["prefix"]["KALOMDPath"] = prefix;
-    return Ask("var/run/kaloelasticd.sock", request)["data"];
+    return AskDaemon(root_.Join("var/run/kaloelasticd.sock"), request)["data"];
   }
 
   Listing Indexed() {
@@ -198,71 +189,49 @@ class StormTest : public ProgramTest {
     SCOPED_TRACE(what);
     const std::string mark = share_ + "/settled.mark";
     WriteFile(mark, std::string(++settles_, 'm'));
-    const auto give_up = std::chrono::steady_clock::now() + kPatience;
-    for (;;) {
-      const Json::Value status = ShareStatus();
+    const bool settled = WaitUntil([&] {
       const Json::Value docs = Documents(mark);
-      const bool marked = docs.size() == 1 && docs[0]["KALOMDFSSize"].asUInt64() == settles_;
-      if (marked && status["state"] == "idle" && status["todo"] == 0 && !HasBytes(QueuePath()) &&
-          !HasBytes(QueuePath() + ".tmp")) {
-        break;
-      }
-      if (std::chrono::steady_clock::now() >= give_up) {
-        FAIL() << "not settled: " << toString(status);
-      }
-      std::this_thread::sleep_for(kPoll);
-    }
+      return docs.size() == 1 && docs[0]["KALOMDFSSize"].asUInt64() == settles_ && Idle();
+    });
+    ASSERT_TRUE(settled) << "not settled: " << toString(ShareStatus());
     Listing disk;
     WalkInto(share_, disk);
     EXPECT_EQ("", Differences(disk, Indexed()));
   }
 
-  long long Reads() { return ShareStatus()["total_read"].asInt64(); }
-
-  pid_t DaemonPid(const std::string& name) {
-    std::ifstream in(root_.Join("var/run/" + name + ".pid"));
-    pid_t pid = 0;
-    in >> pid;
-    return pid;
+  // Whether the indexing daemon is idle with nothing queued.
+  bool Idle() {
+    const Json::Value status = ShareStatus();
+    return status["state"] == "idle" && status["todo"] == 0 && !HasBytes(QueuePath()) &&
+           !HasBytes(QueuePath() + ".tmp");
   }
 
-  // Kills a daemon without warning and waits until it is gone.
+  long long Reads() { return ShareStatus()["total_read"].asInt64(); }
+
+  // Kills a daemon without warning and waits until it is gone (a zombie
+  // counts as gone).
   void Kill(const std::string& name) {
-    const pid_t pid = DaemonPid(name);
-    ASSERT_GT(pid, 0) << name;
-    ASSERT_EQ(0, ::kill(pid, SIGKILL));
-    const auto give_up = std::chrono::steady_clock::now() + kPatience;
-    for (;;) {
-      std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-      std::string line;
-      while (std::getline(status, line) && line.compare(0, 6, "State:") != 0) {
-      }
-      if (!status || line.find('Z') != std::string::npos) break;  // gone, or only a zombie
-      ASSERT_LT(std::chrono::steady_clock::now(), give_up) << name << " does not die";
-      std::this_thread::sleep_for(kPoll);
-    }
+    DaemonProcess daemon;
+    ASSERT_TRUE(daemon.Adopt(PidFile(name))) << name;
+    ASSERT_EQ(0, daemon.Stop(SIGKILL)) << name << " does not die";
   }
 
   // Starts one daemon again (orvex up would take a zombie for it).
   void Restart(const std::string& name) {
-    const ProgramOutcome started = RunProgram(std::string(ORVEX_BUILD_DIR) + "/" + name, {},
-                                              {"ORVEX_ROOT=" + root_.path(), "TZ=UTC"}, io_.path());
+    const ProgramOutcome started = RunIn(BuiltProgram(name), {});
     ASSERT_EQ(0, started.status) << started.err;
   }
 
   // Waits until the indexing daemon has sent at least done documents in
   // its life, or has nothing left to do.
   void WaitDone(long long done) {
-    const auto give_up = std::chrono::steady_clock::now() + kPatience;
-    for (;;) {
-      const Json::Value status = ShareStatus();
-      if (status["total_done"].asInt64() >= done) return;
-      if (status["state"] == "idle" && !HasBytes(QueuePath()) && !HasBytes(QueuePath() + ".tmp")) {
-        return;
-      }
-      ASSERT_LT(std::chrono::steady_clock::now(), give_up) << toString(status);
-      std::this_thread::sleep_for(kPoll);
-    }
+    ASSERT_TRUE(WaitUntil([&] { return ShareStatus()["total_done"].asInt64() >= done || Idle(); }))
+        << toString(ShareStatus());
+  }
+
+  template <typename Pred>
+  static bool WaitUntil(Pred pred) {
+    return testing::WaitUntil(pred, kPatience, kPoll);
   }
 
   std::string share_;
@@ -374,11 +343,8 @@ TEST_F(StormTest, SearchDaemonKilledMidBatchThenBackConverges) {
   WaitDone(before + static_cast<long long>(StormFiles() / 4));
   Kill("kaloelasticd");
   fs::remove_all(share_ + "/d0/e0");
-  const auto give_up = std::chrono::steady_clock::now() + kPatience;
-  while (ShareStatus()["state"] != "retrying") {
-    ASSERT_LT(std::chrono::steady_clock::now(), give_up) << toString(ShareStatus());
-    std::this_thread::sleep_for(kPoll);
-  }
+  ASSERT_TRUE(WaitUntil([&] { return ShareStatus()["state"] == "retrying"; }))
+      << toString(ShareStatus());
   Restart("kaloelasticd");
   // Resuming tells the workers to try again at once instead of at their
   // next retry.
@@ -410,9 +376,7 @@ TEST_F(StormTest, LostEventsAndACrashMarkEndInAWalkThatConverges) {
   MakeFiles(share_ + "/unseen", 200);
   fs::remove_all(share_ + "/d0/e2");
   std::ofstream(share_ + "/d0/e0/f0.txt", std::ios::app) << "changed unseen\n";
-  ::setenv("ORVEX_ROOT", root_.path().c_str(), 1);
   fileindex::AddCustomEvent(fileindex::EVENT_QUEUE_CRASHED, share_, "", Json::Value());
-  ::unsetenv("ORVEX_ROOT");
   Restart("kalonotifyd");
   Settle("crash mark");
 }
@@ -434,11 +398,8 @@ TEST_F(StormTest, FullVolumeDuringCommitFlagsTheShareAndSpaceBackReindexes) {
   ASSERT_EQ(0, Run({"pause"}).status);
   MakeFiles(share_ + "/late", 20);
   WriteFile(share_ + "/late.mark", "");
-  const auto queued = std::chrono::steady_clock::now() + kPatience;
-  while (ReadFileText(QueuePath()).find("late.mark") == std::string::npos) {
-    ASSERT_LT(std::chrono::steady_clock::now(), queued);
-    std::this_thread::sleep_for(kPoll);
-  }
+  ASSERT_TRUE(
+      WaitUntil([&] { return ReadFileText(QueuePath()).find("late.mark") != std::string::npos; }));
   const std::string filler = share_ + "/@eaDir/filler";
   {
     std::ofstream out(filler, std::ios::binary);
@@ -448,13 +409,10 @@ TEST_F(StormTest, FullVolumeDuringCommitFlagsTheShareAndSpaceBackReindexes) {
   }
   ASSERT_EQ(0, Run({"resume"}).status);
   const std::string status_file = root_.Join("var/packages/Orvex/etc/fileindex.status");
-  const auto give_up = std::chrono::steady_clock::now() + kPatience;
-  for (;;) {
+  ASSERT_TRUE(WaitUntil([&] {
     Json::Value status;
-    if (fromFile(status, status_file) && status["share"]["tree"].asInt() & 1) break;
-    ASSERT_LT(std::chrono::steady_clock::now(), give_up) << toString(ShareStatus());
-    std::this_thread::sleep_for(kPoll);
-  }
+    return fromFile(status, status_file) && status["share"]["tree"].asInt() & 1;
+  })) << toString(ShareStatus());
   fs::remove(filler);
   ASSERT_EQ(0, Run({"resume"}).status);
   Settle("space back");

@@ -9,15 +9,12 @@
 #include <filesystem>
 #include <fstream>
 #include <string>
-#include <thread>
 
 #include "support/program_test.h"
 
 namespace orvex {
 namespace testing {
 namespace {
-
-constexpr auto kPatience = std::chrono::seconds(60);
 
 class WholeSystemTest : public ProgramTest {
  protected:
@@ -28,20 +25,17 @@ class WholeSystemTest : public ProgramTest {
     Run({"down"});
   }
 
-  // The output of `orvex search ARGS`, once it contains wanted (or the last
-  // output after a minute): the index follows the disk within moments.
-  std::string SearchUntil(const std::vector<std::string>& args, const std::string& wanted) {
-    std::vector<std::string> command = {"search"};
-    command.insert(command.end(), args.begin(), args.end());
-    const auto give_up = std::chrono::steady_clock::now() + kPatience;
-    for (;;) {
-      const ProgramOutcome outcome = Run(command);
-      if (outcome.out.find(wanted) != std::string::npos ||
-          std::chrono::steady_clock::now() >= give_up) {
-        return outcome.out + outcome.err;
-      }
-      std::this_thread::sleep_for(std::chrono::milliseconds(100));
-    }
+  // The output of `orvex search FRAGMENT`, once it contains wanted (or the
+  // last output after a minute): the index follows the disk within moments.
+  std::string SearchUntil(const std::string& fragment, const std::string& wanted) {
+    ProgramOutcome outcome;
+    WaitUntil(
+        [&] {
+          outcome = Run({"search", fragment});
+          return outcome.out.find(wanted) != std::string::npos;
+        },
+        std::chrono::seconds(60), std::chrono::milliseconds(100));
+    return outcome.out + outcome.err;
   }
 
   std::string MakeTree() {
@@ -84,9 +78,9 @@ TEST_F(WholeSystemTest, IndexedDirectoryIsSearchableByNameAndTextAndFollowsChang
   // A change after the first index reaches the search through the watcher.
   std::ofstream(dir + "/notes/zebra-crossing.txt") << "stripes\n";
   EXPECT_NE(std::string::npos,
-            SearchUntil({"zebra"}, "zebra-crossing.txt").find(dir + "/notes/zebra-crossing.txt"));
+            SearchUntil("zebra", "zebra-crossing.txt").find(dir + "/notes/zebra-crossing.txt"));
   std::filesystem::remove(dir + "/readme.md");
-  EXPECT_NE(std::string::npos, SearchUntil({"readme"}, "0 of 0 hits").find("0 of 0 hits"));
+  EXPECT_NE(std::string::npos, SearchUntil("readme", "0 of 0 hits").find("0 of 0 hits"));
 
   const ProgramOutcome down = Run({"down"});
   EXPECT_EQ(0, down.status) << down.err;
