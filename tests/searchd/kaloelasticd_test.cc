@@ -213,9 +213,8 @@ TEST_F(KaloelasticdTest, TheToolSearchesAndShowsStats) {
   EXPECT_NE(std::string::npos, run.err.find("error 913")) << run.err;
   Start();
   CreateIndex();
-  Json::Value doc = FileDoc("/v/s/Straße.txt", 42);
-  doc["KALOMDTextContent"] = "a wonderful day";
-  Ok(Upsert(kId, doc));
+  Ok(Upsert(kId, DocWith("/v/s/Straße.txt",
+                         R"({"KALOMDFSSize": 42, "KALOMDTextContent": "a wonderful day"})")));
   Ok(Upsert(kId, FileDoc("/v/s/other.txt")));
   Ok(Command("commit", kId));
   run = tool({"search", "STRASSE"});

@@ -50,12 +50,9 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
     return HitPaths(SearchFor(data));
   };
   using Paths = std::vector<std::string>;
-  Json::Value a = FileDoc("/v/s/alpha_report.txt");
-  a["KALOMDTextContent"] = "quarterly figures";
+  Json::Value a = DocWith("/v/s/alpha_report.txt", R"({"KALOMDTextContent": "quarterly figures"})");
   Ok(Upsert(kId, a));
-  Json::Value gone = FileDoc("/v/s/ephemeral.txt");
-  gone["KALOMDTextContent"] = "vanishing words";
-  Ok(Upsert(kId, gone));
+  Ok(Upsert(kId, DocWith("/v/s/ephemeral.txt", R"({"KALOMDTextContent": "vanishing words"})")));
   EXPECT_EQ(1, Ok(DelById(kId, "/v/s/ephemeral.txt"))["data"]["deleted"].asInt());
   // Not committed: not searchable yet.
   EXPECT_EQ(Paths{}, HitPaths(SearchName("alpha")));
@@ -76,11 +73,11 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("annual"));
 
   // Renamed (a new search name), then renamed again before the commit.
-  Json::Value renamed;
-  renamed["KALOMDSearchFileName"] = "beta_report.txt";
-  Ok(SetById(kId, "/v/s/alpha_report.txt", renamed));
-  renamed["KALOMDSearchFileName"] = "gamma_report.txt";
-  Ok(SetById(kId, "/v/s/alpha_report.txt", renamed));
+  const auto rename = [&](const std::string& path, const std::string& name) {
+    Ok(SetById(kId, path, ParseJson(R"({"KALOMDSearchFileName": ")" + name + "\"}")));
+  };
+  rename("/v/s/alpha_report.txt", "beta_report.txt");
+  rename("/v/s/alpha_report.txt", "gamma_report.txt");
   Commit();
   EXPECT_EQ(Paths{}, HitPaths(SearchName("alpha")));
   EXPECT_EQ(Paths{}, HitPaths(SearchName("beta")));
@@ -88,14 +85,10 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("summary"));
 
   // Moved onto another document's path: one document remains there.
-  Json::Value b = FileDoc("/v/s/beta.txt");
-  b["KALOMDTextContent"] = "beta words";
-  Ok(Upsert(kId, b));
+  Ok(Upsert(kId, DocWith("/v/s/beta.txt", R"({"KALOMDTextContent": "beta words"})")));
   Commit();
-  Json::Value moved = FileDoc("/v/s/beta.txt");
-  moved["KALOMDSearchFileName"] = "delta.txt";
-  moved["KALOMDTextContent"] = "delta words";
-  Json::Value req = Upsert(kId, moved);
+  Json::Value req = Upsert(kId, DocWith("/v/s/beta.txt", R"({"KALOMDSearchFileName": "delta.txt",
+                                                             "KALOMDTextContent": "delta words"})"));
   req["data"]["doc_id"] = "/v/s/alpha_report.txt";
   Ok(req);
   Commit();
@@ -114,14 +107,10 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   Ok(DelById(kId, "/v/s/two.txt"));
   Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
   Ok(Upsert(kId, FileDoc("/v/s/three.txt")));
-  Json::Value four;
-  four["KALOMDSearchFileName"] = "four.txt";
-  Ok(SetById(kId, "/v/s/three.txt", four));
+  rename("/v/s/three.txt", "four.txt");
   Ok(Upsert(kId, FileDoc("/v/s/five.txt")));
   Ok(DelById(kId, "/v/s/five.txt"));
-  Json::Value six;
-  six["KALOMDSearchFileName"] = "six.txt";
-  Ok(SetById(kId, "/v/s/one.txt", six));
+  rename("/v/s/one.txt", "six.txt");
   Commit();
   for (const char* gone_name : {"one", "two", "three", "five"}) {
     EXPECT_EQ(Paths{}, HitPaths(SearchName(gone_name))) << gone_name;
@@ -139,15 +128,10 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
 }
 
 TEST_F(SearchEngineTest, UpsertThenSetKeepsThePropertiesNotSet) {
-  Json::Value doc = FileDoc("/v/s/song.mp3", 4000);
-  doc["KALOMDTitle"] = "Blue in Green";
-  doc["KALOMDDurationSecond"] = 337.5;
-  doc["KALOMDTextContent"] = "so what freddie freeloader";
-  Ok(Upsert(kId, doc));
-  Json::Value attrs;
-  attrs["KALOMDFSSize"] = 4096;
-  attrs["KALOMDFSContentChangeDate"] = 1800000000;
-  Ok(SetById(kId, "/v/s/song.mp3", attrs));
+  Ok(Upsert(kId, DocWith("/v/s/song.mp3", R"({"KALOMDFSSize": 4000, "KALOMDTitle": "Blue in Green",
+      "KALOMDDurationSecond": 337.5, "KALOMDTextContent": "so what freddie freeloader"})")));
+  Ok(SetById(kId, "/v/s/song.mp3",
+             ParseJson(R"({"KALOMDFSSize": 4096, "KALOMDFSContentChangeDate": 1800000000})")));
   Commit();
 
   const Json::Value docs = GetByPrefix("/v/s/")["data"];
@@ -358,15 +342,11 @@ TEST_F(SearchEngineTest, SearchFiltersSortsAndPages) {
 }
 
 TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
-  Json::Value a = FileDoc("/v/s/a.txt");
-  a["KALOMDTextContent"] = "The quick brown fox jumps over the lazy dog";
-  Json::Value b = FileDoc("/v/s/b.txt");
-  b["KALOMDTextContent"] = "A brown dog, quick to anger; café au lait";
-  Json::Value c = FileDoc("/v/s/c.txt");
-  c["KALOMDTitle"] = "Quickstart guide";
-  Ok(Upsert(kId, a));
-  Ok(Upsert(kId, b));
-  Ok(Upsert(kId, c));
+  Ok(Upsert(kId, DocWith("/v/s/a.txt", R"({"KALOMDTextContent":
+                                           "The quick brown fox jumps over the lazy dog"})")));
+  Ok(Upsert(kId, DocWith("/v/s/b.txt", R"({"KALOMDTextContent":
+                                           "A brown dog, quick to anger; café au lait"})")));
+  Ok(Upsert(kId, DocWith("/v/s/c.txt", R"({"KALOMDTitle": "Quickstart guide"})")));
   Commit();
   const struct {
     const char* query;

@@ -64,6 +64,14 @@ inline Json::Value FileDoc(const std::string& path, int64_t size = 10) {
   return doc;
 }
 
+// A file's document with the further properties of the JSON text extra.
+inline Json::Value DocWith(const std::string& path, const std::string& extra) {
+  Json::Value doc = FileDoc(path);
+  const Json::Value more = ParseJson(extra);
+  for (const std::string& name : more.getMemberNames()) doc[name] = more[name];
+  return doc;
+}
+
 inline Json::Value Upsert(const std::string& id, const Json::Value& doc) {
   Json::Value req = Command("document_upsert_by_id", id);
   req["data"]["doc_id"] = doc["KALOMDPath"];
