@@ -46,9 +46,9 @@
 #include <utility>
 #include <vector>
 
-#include "../tests/extract/test_files.h"
 #include "bench_timing.h"
 #include "content_extractor.h"
+#include "extract/test_files.h"
 #include "extract_service.h"
 #include "extract_worker.h"
 #include "kalo/kalo_content_extract.h"

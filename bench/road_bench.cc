@@ -46,13 +46,13 @@
 #include <thread>
 #include <vector>
 
-#include "../tests/support/run_program.h"
-#include "../tests/support/temp_dir.h"
 #include "bench_timing.h"
 #include "kalo/kalo_sock.h"
 #include "orvex/foundation/json.h"
 #include "orvex/portable/root.h"
 #include "proc_stats.h"
+#include "support/run_program.h"
+#include "support/temp_dir.h"
 
 namespace {
 
