@@ -354,8 +354,8 @@ std::vector<SearchHit> SortedNameMatches(SqliteDb& db, const SearchQuery& q,
 // How many entries of the name index a walk may read before sorting the
 // matches instead: sorting costs about one entry's read per match, so as
 // many as there are matches (estimated), and never less than a few bounds.
-int64_t WalkBudget(SqliteDb& db, const std::string& folded, int64_t bound) {
-  return std::max(kShortWalkFactor * bound, EstimatedMatches(db, folded));
+int64_t WalkBudget(int64_t estimated_matches, int64_t bound) {
+  return std::max(kShortWalkFactor * bound, estimated_matches);
 }
 
 SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& folded) {
@@ -371,15 +371,18 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
       result.hits = SortedNameMatches(db, q, match);
       return result;
     }
-    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(db, folded, bound), 0);
+    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(EstimatedMatches(db, folded), bound), 0);
     result.hits = w.PageFull() ? HitsOf(db, w.page) : SortedNameMatches(db, q, match);
     result.exact = false;
     return result;
   }
   // A prefix query gathers every match before its first row: only for
   // fragments that look rare, or whose matches the walk did not reach.
-  if (EstimatedMatches(db, folded) >= bound) {
-    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(db, folded, bound), bound);
+  if (const int64_t estimate = EstimatedMatches(db, folded); estimate >= bound) {
+    // Counting on once the page is full reads entries for the total alone:
+    // a short fragment is common, and its total is a bound anyway.
+    const int64_t count_to = std::max(kCountBound, q.offset + q.limit);
+    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(estimate, bound), count_to);
     if (w.PageFull()) {
       result.hits = HitsOf(db, w.page);
       result.total = w.matches;
