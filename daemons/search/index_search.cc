@@ -16,6 +16,7 @@
 #include <algorithm>
 #include <cmath>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -440,38 +441,60 @@ std::vector<SearchHit> Snippets(SqliteDb& db, const TextExpression& text,
   return hits;
 }
 
-// How many text documents hold phrase: counted up to kPhraseCountBound,
-// and beyond it estimated from how far into the ids that count was reached
-// (text documents come in the order their folders are walked, which spreads
-// a common phrase about evenly over the ids).
-double DocumentsHolding(SqliteDb& db, const std::string& phrase) {
-  Statement count(db,
-                  "SELECT count(*), max(rowid), (SELECT min(id) FROM contents), "
-                  "(SELECT max(id) FROM contents) FROM "
-                  "(SELECT rowid FROM words WHERE words MATCH ?1 LIMIT ?2)");
-  count.Bind(1, phrase).Bind(2, kPhraseCountBound);
-  if (!count.Step()) return 0;
-  const auto holding = static_cast<double>(count.Int(0));
-  if (count.Int(0) < kPhraseCountBound) return holding;
-  const int64_t first = count.Int(2);
-  const auto reached = static_cast<double>(count.Int(1) - first + 1);
-  return holding * static_cast<double>(count.Int(3) - first + 1) / reached;
-}
+// How many text documents hold each wanted phrase: counted up to
+// kPhraseCountBound, and beyond it estimated from how far into the ids that
+// count was reached (text documents come in the order their folders are
+// walked, which spreads a common phrase about evenly over the ids).
+class PhraseCounter {
+ public:
+  explicit PhraseCounter(SqliteDb& db)
+      : db_(db),
+        count_(db,
+               "SELECT count(*), max(rowid) FROM "
+               "(SELECT rowid FROM words WHERE words MATCH ?1 LIMIT ?2)") {}
+
+  double DocumentsHolding(const std::string& phrase) {
+    count_.Bind(1, phrase).Bind(2, kPhraseCountBound);
+    count_.Step();
+    const int64_t holding = count_.Int(0), reached = count_.Int(1);
+    count_.Reset();
+    if (holding < kPhraseCountBound) return static_cast<double>(holding);
+    if (!first_id_) ReadIdRange();
+    return static_cast<double>(holding) * static_cast<double>(last_id_ - *first_id_ + 1) /
+           static_cast<double>(reached - *first_id_ + 1);
+  }
+
+ private:
+  // Read once per query, and only for a phrase past the bound.
+  void ReadIdRange() {
+    Statement range(db_, "SELECT (SELECT min(id) FROM contents), (SELECT max(id) FROM contents)");
+    range.Step();
+    first_id_ = range.Int(0);
+    last_id_ = range.Int(1);
+  }
+
+  SqliteDb& db_;
+  Statement count_;
+  std::optional<int64_t> first_id_;
+  int64_t last_id_ = 0;
+};
 
 // The relevance of each match (see text_rank.h), with each phrase's share
 // of the documents estimated cheaply.
 std::string RankOf(SqliteDb& db, const TextExpression& e) {
+  PhraseCounter counter(db);
   std::string rank = std::string(kTextRank) + "(words";
   const size_t wanted = e.phrases.size() - e.excluded;
   for (size_t p = 0; p < e.phrases.size(); ++p) {
-    rank += ", " + (p < wanted ? std::to_string(std::llround(DocumentsHolding(db, e.phrases[p])))
-                               : std::string("-1"));
+    rank +=
+        ", " + (p < wanted ? std::to_string(std::llround(counter.DocumentsHolding(e.phrases[p])))
+                           : std::string("-1"));
   }
   return rank + ")";
 }
 
-// Words: the page's ids by the query's order first, then a snippet for
-// each of them alone.
+// Words: the page's ids by the query's order first, then the snippets of
+// the page's hits alone.
 SearchResult ByWords(SqliteDb& db, const SearchQuery& q, const Filter& f) {
   const int64_t need = q.offset + q.limit;
   const std::string from = " FROM words CROSS JOIN documents d ON d.id = words.rowid WHERE 1";
