@@ -10,6 +10,9 @@ WalCheckpointer::WalCheckpointer(const std::string& path)
   // Its own commits are none: it only copies pages, and must not wait on
   // the writer for long (a passive checkpoint never does).
   db_->Exec("PRAGMA wal_autocheckpoint=0");
+  // A connection opens the log only when it first reads the database: a
+  // checkpoint before that finds no log and copies nothing.
+  db_->Exec("SELECT count(*) FROM sqlite_master");
   thread_ = std::thread([this] { Run(); });
 }
 
