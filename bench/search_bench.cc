@@ -377,6 +377,15 @@ struct Options {
   bool load_only = false;
 };
 
+// Removes the share and index, or with keep says where they are.
+void Leave(const std::string& dir, bool keep) {
+  if (keep) {
+    std::printf("kept: %s\n", dir.c_str());
+  } else {
+    fs::remove_all(dir);
+  }
+}
+
 int Run(const Options& options) {
   const int count = options.count, commit_every = options.commit_every;
   char dir_template[] = "/tmp/search-bench-XXXXXX";
@@ -453,7 +462,7 @@ int Run(const Options& options) {
   std::printf("daemon peak resident memory after the loads: %.1f MB\n",
               static_cast<double>(StatusKiB(daemon.pid(), "VmHWM")) / 1024);
   if (options.load_only) {
-    fs::remove_all(dir);
+    Leave(dir, options.keep);
     return pass ? 0 : 1;
   }
 
@@ -508,11 +517,7 @@ int Run(const Options& options) {
 
   ComparePlocate(share, dir, name_p50);
   CompareRecoll(dir, recoll_texts, text_p50);
-  if (options.keep) {
-    std::printf("kept: %s\n", dir.c_str());
-  } else {
-    fs::remove_all(dir);
-  }
+  Leave(dir, options.keep);
   return pass ? 0 : 1;
 }
 
