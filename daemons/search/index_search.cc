@@ -8,6 +8,9 @@
 //   three code points or more, name_grams counts the matches up to a bound
 //   first; for a shorter one (a prefix query, which gathers every match
 //   before its first row) a sample of the names spread over the index tells.
+//   Names that begin with the fragment (the way most people search) lie
+//   together in the folded-name index: when they are most of the matches,
+//   their page is read there, and only the others are sorted.
 // - words: the matches are ordered by their keys alone (the best-ranked of a
 //   bounded set for "relevance"), and only the page's hits get a snippet.
 // - anything else: one SQL query over the filters.
@@ -15,6 +18,7 @@
 // lower bound (SearchResult::exact).
 #include <algorithm>
 #include <cmath>
+#include <iterator>
 #include <map>
 #include <optional>
 #include <string>
@@ -284,20 +288,32 @@ std::vector<SearchHit> HitsOf(SqliteDb& db, const std::vector<int64_t>& ids) {
   return hits;
 }
 
-// The estimated number of names that hold folded, from a sample.
-int64_t EstimatedMatches(SqliteDb& db, const std::string& folded) {
+// The names that hold a fragment, as a sample of them tells.
+struct Sample {
+  int64_t estimate = 0;  // of the matches in the whole index
+  int64_t matches = 0;   // in the sample
+  int64_t starting = 0;  // of those, the names that begin with the fragment
+
+  bool AllStart() const { return matches > 0 && starting == matches; }
+};
+
+Sample SampleNames(SqliteDb& db, const std::string& folded) {
   const int64_t last = LastId(db);
   Statement stretch(db, "SELECT folded_name FROM documents WHERE id >= ?1 ORDER BY id LIMIT ?2");
-  int64_t read = 0, matches = 0;
+  int64_t read = 0;
+  Sample sample;
   for (int64_t k = 0; k < kSampleStretches; ++k) {
     stretch.Bind(1, last / kSampleStretches * k).Bind(2, kSampleStretch);
     while (stretch.Step()) {
       ++read;
-      matches += stretch.TextView(0).find(folded) != std::string_view::npos;
+      const size_t at = stretch.TextView(0).find(folded);
+      sample.matches += at != std::string_view::npos;
+      sample.starting += at == 0;
     }
     stretch.Reset();
   }
-  return read == 0 ? 0 : matches * last / read;
+  if (read > 0) sample.estimate = sample.matches * last / read;
+  return sample;
 }
 
 // The folded-name index read in the query's order, keeping the names that
@@ -352,6 +368,68 @@ std::vector<SearchHit> SortedNameMatches(SqliteDb& db, const SearchQuery& q,
   return hits;
 }
 
+// The names that begin with folded: one stretch of the folded-name index.
+int64_t CountStarting(SqliteDb& db, const std::string& folded, int64_t bound) {
+  Statement count(db,
+                  "SELECT count(*) FROM (SELECT 1 FROM documents INDEXED BY documents_folded_name "
+                  "WHERE folded_name >= ?1 AND folded_name < ?2 LIMIT ?3)");
+  count.Bind(1, folded).Bind(2, PrefixUpperBound(folded)).Bind(3, bound);
+  count.Step();
+  return count.Int(0);
+}
+
+std::vector<SearchHit> StartingPage(SqliteDb& db, const SearchQuery& q, const std::string& folded) {
+  const std::string dir = q.descending ? " DESC" : "";
+  Statement rows(db, std::string("SELECT ") + kHitColumns +
+                         " FROM documents d INDEXED BY documents_folded_name "
+                         "WHERE d.folded_name >= ?1 AND d.folded_name < ?2 ORDER BY d.folded_name" +
+                         dir + ", d.path" + dir + " LIMIT ?3");
+  rows.Bind(1, folded).Bind(2, PrefixUpperBound(folded)).Bind(3, q.offset + q.limit);
+  std::vector<SearchHit> hits;
+  while (rows.Step()) hits.push_back(ReadHit(rows));
+  return hits;
+}
+
+// The page of a fragment of three code points or more read as two parts:
+// the names that begin with it, from their stretch of the name index, and
+// the names that hold it further in, from name_grams ("^" anchors a phrase
+// at a name's first code point), sorted. Worth it when the first part is
+// most of the matches: nullopt when it is not. matches is the fragment's
+// count when it is known exactly, or nullopt when it passed the bound.
+std::optional<SearchResult> ByStart(SqliteDb& db, const SearchQuery& q, const std::string& folded,
+                                    std::optional<int64_t> matches) {
+  const int64_t starting = CountStarting(db, folded, matches ? *matches : kMaxCountBound + 1);
+  const std::string match = NameMatch(folded);
+  int64_t inside = 0;
+  if (matches) {
+    inside = *matches - starting;
+  } else {
+    // Counting the matches on past the starting ones tells how many lie
+    // further in; when many do, the walk finds them sooner.
+    if (starting > kMaxCountBound) return std::nullopt;
+    Filter by_name;
+    by_name.text_args.push_back(match);
+    inside = CountUpTo(db, " FROM name_grams WHERE name_grams MATCH ?", by_name,
+                       starting + kCountBound) -
+             starting;
+    if (inside >= kCountBound) return std::nullopt;
+  }
+  if (starting < inside) return std::nullopt;
+  SearchResult result;
+  result.total = starting + inside;
+  result.hits = StartingPage(db, q, folded);
+  if (inside == 0) return result;
+  const std::vector<SearchHit> further = SortedNameMatches(db, q, match + " NOT ^" + match);
+  std::vector<SearchHit> merged;
+  std::merge(std::make_move_iterator(result.hits.begin()),
+             std::make_move_iterator(result.hits.end()), further.begin(), further.end(),
+             std::back_inserter(merged),
+             [&q](const SearchHit& a, const SearchHit& b) { return HitBefore(a, b, q); });
+  merged.resize(std::min<size_t>(merged.size(), static_cast<size_t>(q.offset + q.limit)));
+  result.hits = std::move(merged);
+  return result;
+}
+
 // How many entries of the name index a walk may read before sorting the
 // matches instead: sorting costs about one entry's read per match, so as
 // many as there are matches (estimated), and never less than a few bounds.
@@ -367,19 +445,24 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
   const std::string grams = " FROM name_grams WHERE name_grams MATCH ?";
   SearchResult result;
   if (CodePointCount(folded) >= kTrigram) {
+    const Sample sample = SampleNames(db, folded);
+    if (sample.AllStart()) {
+      if (auto split = ByStart(db, q, folded, std::nullopt)) return *split;
+    }
     result.total = CountUpTo(db, grams, by_name, bound);
     if (result.total < bound) {
+      if (auto split = ByStart(db, q, folded, result.total)) return *split;
       result.hits = SortedNameMatches(db, q, match);
       return result;
     }
-    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(EstimatedMatches(db, folded), bound), 0);
+    const Walk w = WalkNameIndex(db, q, folded, WalkBudget(sample.estimate, bound), 0);
     result.hits = w.PageFull() ? HitsOf(db, w.page) : SortedNameMatches(db, q, match);
     result.exact = false;
     return result;
   }
   // A prefix query gathers every match before its first row: only for
   // fragments that look rare, or whose matches the walk did not reach.
-  if (const int64_t estimate = EstimatedMatches(db, folded); estimate >= bound) {
+  if (const int64_t estimate = SampleNames(db, folded).estimate; estimate >= bound) {
     // Counting on once the page is full reads entries for the total alone:
     // a short fragment is common, and its total is a bound anyway.
     const int64_t count_to = std::max(kCountBound, q.offset + q.limit);
@@ -524,6 +607,18 @@ bool NameAlone(const SearchQuery& q, const std::string& folded) {
 }
 
 }  // namespace
+
+bool HitBefore(const SearchHit& a, const SearchHit& b, const SearchQuery& q) {
+  auto by = [&](auto key_a, auto key_b) {
+    if (key_a != key_b) return q.descending ? key_b < key_a : key_a < key_b;
+    return q.descending ? b.path < a.path : a.path < b.path;
+  };
+  if (q.sort == "relevance" && !q.text.empty()) return by(a.rank, b.rank);
+  if (q.sort == "path") return by(a.path, b.path);
+  if (q.sort == "size") return by(a.size.value_or(-1), b.size.value_or(-1));
+  if (q.sort == "mtime") return by(a.mtime.value_or(-1), b.mtime.value_or(-1));
+  return by(a.folded_name, b.folded_name);
+}
 
 SearchResult IndexStore::Search(const SearchQuery& q) {
   const std::string folded = FoldCase(q.name);

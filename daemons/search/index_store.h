@@ -148,6 +148,10 @@ class IndexStore {
   std::vector<std::string> text_properties_;  // those searched as words
 };
 
+// Whether a comes before b in q's order, ties by path in the same
+// direction: the order of an index's hits, and of hits merged from several.
+bool HitBefore(const SearchHit& a, const SearchHit& b, const SearchQuery& q);
+
 // The smallest string greater than every string that begins with prefix,
 // for range scans on the path index; empty when there is none.
 std::string PrefixUpperBound(const std::string& prefix);

@@ -163,19 +163,6 @@ SearchQuery ParseQuery(const Json::Value& data) {
   return q;
 }
 
-// The merge order of hits from several indexes: the order each index used.
-bool Before(const SearchHit& a, const SearchHit& b, const SearchQuery& q) {
-  auto by = [&](auto key_a, auto key_b) {
-    if (key_a != key_b) return q.descending ? key_b < key_a : key_a < key_b;
-    return q.descending ? b.path < a.path : a.path < b.path;
-  };
-  if (q.sort == "relevance" && !q.text.empty()) return by(a.rank, b.rank);
-  if (q.sort == "path") return by(a.path, b.path);
-  if (q.sort == "size") return by(a.size.value_or(-1), b.size.value_or(-1));
-  if (q.sort == "mtime") return by(a.mtime.value_or(-1), b.mtime.value_or(-1));
-  return by(a.folded_name, b.folded_name);
-}
-
 Json::Value HitJson(const SearchHit& hit, const std::string& id) {
   Json::Value out;
   out["id"] = id;
@@ -524,7 +511,7 @@ Json::Value SearchEngine::Search(const Json::Value& data, const Caller& caller) 
     for (SearchHit& hit : result.hits) hits.emplace_back(std::move(hit), id);
   }
   std::stable_sort(hits.begin(), hits.end(),
-                   [&](const auto& a, const auto& b) { return Before(a.first, b.first, q); });
+                   [&](const auto& a, const auto& b) { return HitBefore(a.first, b.first, q); });
   Json::Value answer;
   answer["data"]["total"] = static_cast<Json::Int64>(total);
   answer["data"]["total_exact"] = exact;

@@ -291,15 +291,23 @@ TEST_F(SearchEngineTest, NameFragmentsMatchANaiveScan) {
   EXPECT_NE(ten.end(), std::find(ten.begin(), ten.end(), "/v/s/xxSTRASSEab-1yy"));
 }
 
-// Many matches take the other way to the first page (the name index read in
-// order); both directions and an offset must still give the model's page.
+// Each way to a fragment's first page must give the model's page, in both
+// directions and after an offset: the name index read in order ("photo" is
+// in many names, all over), the names that begin with the fragment read
+// from their stretch of that index ("report_" begins 1,100 names and is
+// inside none), and that stretch merged with the few that hold it further
+// in ("album"). Names repeat in other folders: ties go by path.
 TEST_F(SearchEngineTest, CommonFragmentsPageInNameOrderLikeTheModel) {
   std::mt19937 random(7);
   std::vector<std::pair<std::string, std::string>> model;  // folded name, path
   Json::Value compound;
   for (int i = 0; i < 1500; ++i) {
-    std::string name = std::string(1, static_cast<char>('A' + random() % 26)) + "x" +
-                       std::to_string(random() % 100) + (i % 3 ? "Photo" : "PHOTO") + ".jpg";
+    const std::string letter(1, static_cast<char>('A' + random() % 26));
+    const std::string number = std::to_string(random() % 3);
+    std::string name = letter + "x" + number + (i % 3 ? "Photo" : "PHOTO") + ".jpg";
+    if (i < 1100) name = (i % 2 ? "Report_" : "REPORT_") + name;
+    if (i >= 1100 && i < 1400) name = "Album" + number + letter + ".jpg";
+    if (i >= 1400) name = letter + number + "_ALBUM.jpg";
     const std::string path = "/v/s/d" + std::to_string(i) + "/" + name;
     model.emplace_back(search::FoldCase(name), path);
     compound["compound"].append(Upsert(kId, FileDoc(path)));
@@ -307,18 +315,31 @@ TEST_F(SearchEngineTest, CommonFragmentsPageInNameOrderLikeTheModel) {
   Ok(compound);
   Commit();
   std::sort(model.begin(), model.end());
-  for (const bool descending : {false, true}) {
-    if (descending) std::reverse(model.begin(), model.end());
-    std::vector<std::string> expected;
-    for (size_t i = 10; i < 60; ++i) expected.push_back(model[i].second);
-    const Json::Value answer =
-        SearchFor(ParseJson(R"({"name": "pHoTo", "offset": 10, "limit": 50)" +
-                            std::string(descending ? R"(, "order": "desc"})" : "}")));
-    // Counting stopped early: at least the page's end, never more than matched.
-    EXPECT_FALSE(answer["data"]["total_exact"].asBool());
-    EXPECT_GE(answer["data"]["total"].asInt(), 60) << "descending " << descending;
-    EXPECT_LE(answer["data"]["total"].asInt(), 1500) << "descending " << descending;
-    EXPECT_EQ(expected, HitPaths(answer)) << "descending " << descending;
+  const struct {
+    const char* fragment;
+    bool exact;  // whether the total is counted to the end
+  } cases[] = {{"pHoTo", false}, {"rEpOrT_", true}, {"ALBUM", true}};
+  for (const auto& c : cases) {
+    std::vector<std::pair<std::string, std::string>> matches;
+    for (const auto& entry : model) {
+      if (entry.first.find(search::FoldCase(c.fragment)) != std::string::npos) {
+        matches.push_back(entry);
+      }
+    }
+    for (const bool descending : {false, true}) {
+      if (descending) std::reverse(matches.begin(), matches.end());
+      std::vector<std::string> expected;
+      for (size_t i = 10; i < 60; ++i) expected.push_back(matches[i].second);
+      const Json::Value answer = SearchFor(ParseJson(std::string(R"({"name": ")") + c.fragment +
+                                                     R"(", "offset": 10, "limit": 50)" +
+                                                     (descending ? R"(, "order": "desc"})" : "}")));
+      const std::string where = std::string(c.fragment) + (descending ? " descending" : "");
+      EXPECT_EQ(expected, HitPaths(answer)) << where;
+      EXPECT_EQ(c.exact, answer["data"]["total_exact"].asBool()) << where;
+      // A count stopped early is at least the page's end, never more than matched.
+      EXPECT_GE(answer["data"]["total"].asInt(), c.exact ? matches.size() : 60) << where;
+      EXPECT_LE(answer["data"]["total"].asInt(), matches.size()) << where;
+    }
   }
 }
 
