@@ -397,8 +397,9 @@ int Run(const Options& options) {
   std::mt19937 random(42);
   for (int i = 0; i < count; ++i) {
     share.names.push_back(Name(random, i));
-    share.paths.push_back(share.root + "/d" + std::to_string(i % kFolders) + "/" +
-                          share.names.back());
+    // Folder by folder, as the indexer's crawl sends them.
+    const int64_t folder = int64_t{i} * kFolders / count;
+    share.paths.push_back(share.root + "/d" + std::to_string(folder) + "/" + share.names.back());
   }
   const double tree_seconds = orvex::bench::SecondsOf([&] { MakeTree(share); });
   std::printf("share: %d files in %d folders under %s, made in %.1f s\n", count, kFolders,
