@@ -4,11 +4,11 @@
 // - a name fragment alone, in name order (the usual search): a fragment that
 //   matches many names is found by walking the folded-name index in order
 //   and keeping the matches, which stops at the page's end; one that matches
-//   few is looked up in name_grams and its matches sorted. Which one: for
-//   three code points or more, name_grams counts the matches up to a bound
-//   first; for a shorter one (a prefix query, which gathers every match
-//   before its first row) a sample of the names spread over the index tells.
-//   Names that begin with the fragment (the way most people search) lie
+//   few is looked up in name_grams and its matches sorted. Which one: a
+//   sample of the names spread over the index tells first; for three code
+//   points or more name_grams then counts the matches up to a bound (a
+//   short fragment is a prefix query there, which gathers every match
+//   before its first row). Names that begin with the fragment (the way most people search) lie
 //   together in the folded-name index: when they are most of the matches,
 //   their page is read there, and only the others are sorted.
 // - words: the matches are ordered by their keys alone (the best-ranked of a
@@ -42,6 +42,9 @@ constexpr int64_t kMaxCountBound = 50000;
 // A walk of the name index reads at least this many times the count
 // bound's worth of entries before it gives up for a sort.
 constexpr int64_t kShortWalkFactor = 4;
+// A fragment estimated to match this many times the count bound is taken
+// to be common.
+constexpr int64_t kCommonFactor = 2;
 // A short fragment's share of the names is estimated on this many stretches
 // of this many documents, spread over the row ids (the order they came in,
 // which is not the name order: the walk's own start says little of the rest).
@@ -449,8 +452,13 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
     if (sample.AllStart()) {
       if (auto split = ByStart(db, q, folded, std::nullopt)) return *split;
     }
-    result.total = CountUpTo(db, grams, by_name, bound);
-    if (result.total < bound) {
+    // A fragment the sample finds in many names goes to the walk: its total
+    // is a bound either way, and counting it to the walk's bound would cost
+    // about as much as the walk.
+    const bool common = sample.estimate >= kCommonFactor * bound;
+    const int64_t count_to = common ? std::max(kCountBound, q.offset + q.limit) : bound;
+    result.total = CountUpTo(db, grams, by_name, count_to);
+    if (result.total < count_to) {
       if (auto split = ByStart(db, q, folded, result.total)) return *split;
       result.hits = SortedNameMatches(db, q, match);
       return result;

@@ -293,21 +293,22 @@ TEST_F(SearchEngineTest, NameFragmentsMatchANaiveScan) {
 
 // Each way to a fragment's first page must give the model's page, in both
 // directions and after an offset: the name index read in order ("photo" is
-// in many names, all over), the names that begin with the fragment read
-// from their stretch of that index ("report_" begins 1,100 names and is
-// inside none), and that stretch merged with the few that hold it further
-// in ("album"). Names repeat in other folders: ties go by path.
+// in so many names that it is counted only to 1,000), the names that begin
+// with the fragment read from their stretch of that index ("report_" begins
+// 2,200 names and is inside none), and that stretch merged with the few
+// that hold it further in ("album"). Names repeat in other folders: ties go
+// by path.
 TEST_F(SearchEngineTest, CommonFragmentsPageInNameOrderLikeTheModel) {
   std::mt19937 random(7);
   std::vector<std::pair<std::string, std::string>> model;  // folded name, path
   Json::Value compound;
-  for (int i = 0; i < 1500; ++i) {
+  for (int i = 0; i < 3000; ++i) {
     const std::string letter(1, static_cast<char>('A' + random() % 26));
     const std::string number = std::to_string(random() % 3);
     std::string name = letter + "x" + number + (i % 3 ? "Photo" : "PHOTO") + ".jpg";
-    if (i < 1100) name = (i % 2 ? "Report_" : "REPORT_") + name;
-    if (i >= 1100 && i < 1400) name = "Album" + number + letter + ".jpg";
-    if (i >= 1400) name = letter + number + "_ALBUM.jpg";
+    if (i < 2200) name = (i % 2 ? "Report_" : "REPORT_") + name;
+    if (i >= 2200 && i < 2800) name = "Album" + number + letter + ".jpg";
+    if (i >= 2800) name = letter + number + "_ALBUM.jpg";
     const std::string path = "/v/s/d" + std::to_string(i) + "/" + name;
     model.emplace_back(search::FoldCase(name), path);
     compound["compound"].append(Upsert(kId, FileDoc(path)));
