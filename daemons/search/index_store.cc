@@ -201,6 +201,78 @@ bool TypeMatches(const std::string& type, const Json::Value& v) {
   return std::all_of(v.begin(), v.end(), [](const Json::Value& item) { return item.isString(); });
 }
 
+bool FlatTypeMatches(const std::string& type, FlatDocument::Kind kind) {
+  using Kind = FlatDocument::Kind;
+  if (kind == Kind::kNull) return true;
+  if (type == "int" || type == "double") return kind == Kind::kInt;
+  if (type == "bool") return kind == Kind::kBool;
+  return kind == Kind::kString;
+}
+
+// What a row is made of, read from a document's value tree...
+class ValueFields {
+ public:
+  explicit ValueFields(const Json::Value& doc) : doc_(doc) {}
+
+  bool IsString(const char* key) const { return doc_[key].isString(); }
+  std::string String(const char* key) const { return StringMember(doc_, key); }
+  bool True(const char* key) const { return doc_[key].isBool() && doc_[key].asBool(); }
+  std::optional<int64_t> Int(const char* key) const { return IntMember(doc_, key); }
+  std::string Owner() const {
+    const Json::Value& owner = doc_["KALOMDOwnerUserID"];
+    if (owner.isString()) return owner.asString();
+    return owner.isIntegral() ? std::to_string(owner.asInt64()) : std::string();
+  }
+  void AppendWords(const std::string& key, std::string& out) const { AppendText(doc_[key], out); }
+
+ private:
+  const Json::Value& doc_;
+};
+
+// ... or from a flat document's properties (the last of a name wins, as in
+// a value tree).
+class FlatFields {
+ public:
+  explicit FlatFields(const FlatDocument& doc) : doc_(doc) {}
+
+  bool IsString(const char* key) const {
+    const FlatDocument::Property* p = Find(key);
+    return p != nullptr && p->kind == FlatDocument::Kind::kString;
+  }
+  std::string String(const char* key) const {
+    return IsString(key) ? std::string(Find(key)->text) : std::string();
+  }
+  bool True(const char* key) const {
+    const FlatDocument::Property* p = Find(key);
+    return p != nullptr && p->kind == FlatDocument::Kind::kBool && p->flag;
+  }
+  std::optional<int64_t> Int(const char* key) const {
+    const FlatDocument::Property* p = Find(key);
+    if (p == nullptr || p->kind != FlatDocument::Kind::kInt) return std::nullopt;
+    return p->number;
+  }
+  std::string Owner() const {
+    const FlatDocument::Property* p = Find("KALOMDOwnerUserID");
+    if (p != nullptr && p->kind == FlatDocument::Kind::kInt) return std::to_string(p->number);
+    return String("KALOMDOwnerUserID");
+  }
+  void AppendWords(const std::string& key, std::string& out) const {
+    if (!IsString(key.c_str())) return;
+    if (!out.empty()) out += '\n';
+    out += Find(key.c_str())->text;
+  }
+
+ private:
+  const FlatDocument::Property* Find(std::string_view key) const {
+    for (auto p = doc_.properties.rbegin(); p != doc_.properties.rend(); ++p) {
+      if (p->name == key) return &*p;
+    }
+    return nullptr;
+  }
+
+  const FlatDocument& doc_;
+};
+
 void ExecPragmas(SqliteDb& db) {
   db.Exec("PRAGMA journal_mode=WAL");
   // NORMAL in WAL mode: a commit survives a crash of the daemon, and only a
@@ -452,33 +524,36 @@ std::optional<int64_t> IndexStore::FindId(const std::string& path) {
   return id;
 }
 
-IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value& doc,
-                                    std::string_view doc_text) const {
+template <typename Fields>
+IndexStore::Row IndexStore::RowOf(const std::string& doc_id, const Fields& doc) const {
   Row row;
-  row.path = doc["KALOMDPath"].isString() ? doc["KALOMDPath"].asString() : doc_id;
+  row.path = doc.IsString("KALOMDPath") ? doc.String("KALOMDPath") : doc_id;
   const size_t slash = row.path.rfind('/');
-  row.name = StringMember(doc, "KALOMDFSName");
+  row.name = doc.String("KALOMDFSName");
   if (row.name.empty())
     row.name = slash == std::string::npos ? row.path : row.path.substr(slash + 1);
-  row.parent = StringMember(doc, "KALOMDParent");
+  row.parent = doc.String("KALOMDParent");
   if (row.parent.empty() && slash != std::string::npos) row.parent = row.path.substr(0, slash);
-  std::string search_name = StringMember(doc, "KALOMDSearchFileName");
+  std::string search_name = doc.String("KALOMDSearchFileName");
   if (search_name.empty()) search_name = row.name;
   row.folded_name = FoldCase(search_name);
-  row.extension = doc["KALOMDExtension"].isString() ? LowerAscii(doc["KALOMDExtension"].asString())
-                                                    : ExtensionOf(row.name);
-  row.is_dir = doc["KALOMDIsDir"].isBool() && doc["KALOMDIsDir"].asBool();
+  row.extension = doc.IsString("KALOMDExtension") ? LowerAscii(doc.String("KALOMDExtension"))
+                                                  : ExtensionOf(row.name);
+  row.is_dir = doc.True("KALOMDIsDir");
   row.type = TypeName(row.is_dir, row.extension);
-  row.size = IntMember(doc, "KALOMDFSSize");
-  row.mtime = IntMember(doc, "KALOMDFSContentChangeDate");
-  row.ctime = IntMember(doc, "KALOMDAttributeChangeDate");
-  row.crtime = IntMember(doc, "KALOMDFSCreationDate");
-  const Json::Value& owner = doc["KALOMDOwnerUserID"];
-  row.owner = owner.isString()     ? owner.asString()
-              : owner.isIntegral() ? std::to_string(owner.asInt64())
-                                   : std::string();
-  row.text = StringMember(doc, "KALOMDTextContent");
-  for (const std::string& name : text_properties_) AppendText(doc[name], row.props);
+  row.size = doc.Int("KALOMDFSSize");
+  row.mtime = doc.Int("KALOMDFSContentChangeDate");
+  row.ctime = doc.Int("KALOMDAttributeChangeDate");
+  row.crtime = doc.Int("KALOMDFSCreationDate");
+  row.owner = doc.Owner();
+  row.text = doc.String("KALOMDTextContent");
+  for (const std::string& name : text_properties_) doc.AppendWords(name, row.props);
+  return row;
+}
+
+IndexStore::Row IndexStore::MakeRow(const std::string& doc_id, const Json::Value& doc,
+                                    std::string_view doc_text) const {
+  Row row = RowOf(doc_id, ValueFields(doc));
   // The body is the document with its path and without its text content.
   // The indexer's documents of names and attributes already are: they are
   // kept as they came, or written out without a copy.
@@ -549,7 +624,27 @@ void IndexStore::Update(int64_t id, const Row& row) {
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& doc,
                         std::string_view doc_text) {
   CheckTypes(doc);
-  const Row row = MakeRow(doc_id, doc, doc_text);
+  Write(doc_id, MakeRow(doc_id, doc, doc_text));
+}
+
+bool IndexStore::UpsertFlat(const std::string& doc_id, const FlatDocument& doc) {
+  bool has_path = false;
+  for (const FlatDocument::Property& p : doc.properties) {
+    // Text content makes the body differ from the document; a wrong type
+    // needs its value for the error.
+    if (p.name == "KALOMDTextContent") return false;
+    if (p.name == "KALOMDPath") has_path = p.kind == FlatDocument::Kind::kString;
+    const auto it = types_.find(p.name);
+    if (it != types_.end() && !FlatTypeMatches(it->second, p.kind)) return false;
+  }
+  if (!has_path) return false;
+  Row row = RowOf(doc_id, FlatFields(doc));
+  row.body = doc.text;
+  Write(doc_id, row);
+  return true;
+}
+
+void IndexStore::Write(const std::string& doc_id, const Row& row) {
   Begin();
   // A new document without words is one statement, which SQLite makes whole
   // or undoes by itself: no savepoint around it. Sent at its own path, it

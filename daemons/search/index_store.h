@@ -58,6 +58,22 @@ struct SearchResult {
   std::vector<SearchHit> hits;
 };
 
+// A document whose properties are all strings, integers, booleans or null,
+// as the indexer sends names and attributes: read from a request's text
+// without a JSON value tree. The views point into the text it was read from.
+struct FlatDocument {
+  enum class Kind { kNull, kString, kInt, kBool };
+  struct Property {
+    std::string_view name;
+    Kind kind = Kind::kNull;
+    std::string_view text;  // kString
+    int64_t number = 0;     // kInt
+    bool flag = false;      // kBool
+  };
+  std::vector<Property> properties;  // in the order of the text, repeats included
+  std::string text;                  // the document as JSON text
+};
+
 class IndexStore {
  public:
   // Opens the database at path, creating it (and its directory) when create
@@ -77,6 +93,10 @@ class IndexStore {
   // kBadArgument when a property has the wrong type.
   void Upsert(const std::string& doc_id, const Json::Value& doc,
               std::string_view doc_text = std::string_view());
+  // Upsert() of a flat document, without its value tree. False, with nothing
+  // done, when it needs the value (text content, a property of the wrong
+  // type, no KALOMDPath string): the caller then calls Upsert().
+  bool UpsertFlat(const std::string& doc_id, const FlatDocument& doc);
   // Sets the members of changes in document doc_id, keeping the others; a new
   // KALOMDPath moves the document (replacing any other at that path). Throws
   // kNoSuchDocument when there is no such document.
@@ -126,8 +146,13 @@ class IndexStore {
   auto Atomically(Change change);
   void CheckTypes(const Json::Value& doc) const;
   std::optional<int64_t> FindId(const std::string& path);
+  // A row of what doc's fields (ValueFields or FlatFields) say, without its body.
+  template <typename Fields>
+  Row RowOf(const std::string& doc_id, const Fields& doc) const;
   Row MakeRow(const std::string& doc_id, const Json::Value& doc,
               std::string_view doc_text = std::string_view()) const;
+  // Writes row as the document doc_id: new, or over the one it replaces.
+  void Write(const std::string& doc_id, const Row& row);
   void Insert(const Row& row);
   // Inserts row unless its path is taken; false when it was.
   bool InsertNew(const Row& row);
