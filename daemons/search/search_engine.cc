@@ -264,23 +264,32 @@ Json::Value SearchEngine::Handle(const Json::Value& request, const Caller& calle
   }
 }
 
-Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& caller,
-                                   std::string_view text) {
-  if (!items.isArray()) throw SearchError(kBadArgument, "\"compound\" must be an array");
+Json::Value SearchEngine::CompoundAnswer() {
   Json::Value answer;
   answer["success"] = true;
   answer["has_fail"] = false;
   answer["data"] = Json::Value(Json::arrayValue);
-  for (const Json::Value& item : items) {
-    Json::Value result;
-    if (item.isObject() && item.isMember("compound")) {
-      result = ErrorAnswer(kBadArgument, "a compound request cannot hold another");
-    } else {
-      result = Handle(item, caller, text);
-    }
-    if (!result["success"].asBool()) answer["has_fail"] = true;
-    answer["data"].append(std::move(result));
+  return answer;
+}
+
+void SearchEngine::AddResult(Json::Value& answer, Json::Value result) {
+  if (!result["success"].asBool()) answer["has_fail"] = true;
+  answer["data"].append(std::move(result));
+}
+
+Json::Value SearchEngine::CompoundItem(const Json::Value& item, const Caller& caller,
+                                       std::string_view text) {
+  if (item.isObject() && item.isMember("compound")) {
+    return ErrorAnswer(kBadArgument, "a compound request cannot hold another");
   }
+  return Handle(item, caller, text);
+}
+
+Json::Value SearchEngine::Compound(const Json::Value& items, const Caller& caller,
+                                   std::string_view text) {
+  if (!items.isArray()) throw SearchError(kBadArgument, "\"compound\" must be an array");
+  Json::Value answer = CompoundAnswer();
+  for (const Json::Value& item : items) AddResult(answer, CompoundItem(item, caller, text));
   return answer;
 }
 

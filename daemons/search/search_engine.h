@@ -10,6 +10,7 @@
 
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -42,12 +43,23 @@ class SearchEngine {
   Json::Value Handle(const Json::Value& request, const Caller& caller,
                      std::string_view text = std::string_view());
 
+  // The answer Handle() gives to the compound request in text, read without
+  // a JSON value tree for its upserts (the bulk of an index's load); nullopt,
+  // with nothing done, when text is not a compound request that it can read
+  // whole: the caller then parses it and calls Handle(). Never throws.
+  std::optional<Json::Value> HandleCompound(std::string_view text, const Caller& caller);
+
   // An answer with "success" false.
   static Json::Value ErrorAnswer(int code, const std::string& msg);
 
  private:
   Json::Value Dispatch(const Json::Value& request, const Caller& caller, std::string_view text);
   Json::Value Compound(const Json::Value& items, const Caller& caller, std::string_view text);
+  // A compound's answer without results yet, one result added to it, and
+  // the result of one of its sub-requests (which may not be a compound).
+  static Json::Value CompoundAnswer();
+  static void AddResult(Json::Value& answer, Json::Value result);
+  Json::Value CompoundItem(const Json::Value& item, const Caller& caller, std::string_view text);
 
   Json::Value IndexCreate(const Json::Value& data);
   Json::Value IndexDelete(const Json::Value& data);

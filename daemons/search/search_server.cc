@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <optional>
 #include <system_error>
 #include <vector>
 
@@ -199,10 +200,14 @@ void SearchServer::OnFrame(Connection& c) {
         SearchEngine::ErrorAnswer(kBadJson, "the request must be JSON text ending in one NUL byte");
   } else {
     body.pop_back();
-    Json::Value request;
-    answer = fromString(request, body)
-                 ? engine_.Handle(request, c.caller, body)
-                 : SearchEngine::ErrorAnswer(kBadJson, "the request is not JSON text");
+    if (std::optional<Json::Value> upserted = engine_.HandleCompound(body, c.caller)) {
+      answer = std::move(*upserted);
+    } else {
+      Json::Value request;
+      answer = fromString(request, body)
+                   ? engine_.Handle(request, c.caller, body)
+                   : SearchEngine::ErrorAnswer(kBadJson, "the request is not JSON text");
+    }
   }
   Answer(c, JsonText(answer), /*close_after=*/false);
 }
