@@ -40,6 +40,11 @@ constexpr int64_t kJournalSizeLimit = int64_t{WalCheckpointer::kLimitFrames} * 4
 // indexed is simply no longer noted. The notes are empty between commits,
 // and a rolled-back transaction takes its notes with it.
 //
+// A row's words are noted only where no note is: words rewritten twice in
+// a transaction are written by an upsert (INSERT ... ON CONFLICT DO UPDATE),
+// whose conflict handling overrides a trigger's own, so that an "INSERT OR
+// IGNORE" of the second note would fail the command.
+//
 // New documents, the bulk of a load, are not noted one by one: a
 // transaction numbers its new rows itself, from the id in unindexed_from
 // up, so that "not yet in name_grams" is, for them, their id alone. Only
@@ -120,11 +125,13 @@ CREATE TRIGGER IF NOT EXISTS contents_removed AFTER DELETE ON contents BEGIN
     WHERE NOT EXISTS (SELECT 1 FROM unindexed_words WHERE id = old.id);
   DELETE FROM unindexed_words WHERE id = old.id;
 END;
-CREATE TRIGGER IF NOT EXISTS contents_changed AFTER UPDATE ON contents BEGIN
+DROP TRIGGER IF EXISTS contents_changed;
+CREATE TRIGGER IF NOT EXISTS contents_rewritten AFTER UPDATE ON contents BEGIN
   INSERT INTO words(words, rowid, text, props)
     SELECT 'delete', old.id, old.text, old.props
     WHERE NOT EXISTS (SELECT 1 FROM unindexed_words WHERE id = old.id);
-  INSERT OR IGNORE INTO unindexed_words(id) VALUES (new.id);
+  INSERT INTO unindexed_words(id)
+    SELECT new.id WHERE NOT EXISTS (SELECT 1 FROM unindexed_words WHERE id = new.id);
 END;
 )sql";
 

@@ -71,6 +71,14 @@ TEST_F(SearchEngineTest, FullTextIndexesFollowEveryChangeAcrossCommits) {
   Commit();
   EXPECT_EQ(Paths{}, text_search("quarterly"));
   EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("annual"));
+  // Its words changed twice before one commit (a file saved twice).
+  a["KALOMDTextContent"] = "first draft";
+  Ok(Upsert(kId, a));
+  a["KALOMDTextContent"] = "annual summary";
+  Ok(Upsert(kId, a));
+  Commit();
+  EXPECT_EQ(Paths{}, text_search("draft"));
+  EXPECT_EQ(Paths{"/v/s/alpha_report.txt"}, text_search("annual"));
 
   // Renamed (a new search name), then renamed again before the commit.
   const auto rename = [&](const std::string& path, const std::string& name) {
