@@ -4,6 +4,8 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <optional>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -40,11 +42,15 @@ std::string UpsertText(const std::string& doc_id, const std::string& doc,
          R"(","data":)" + doc + "}}";
 }
 
-std::string WithId(std::string text, const std::string& id) {
-  for (size_t at = text.find("@ID@"); at != std::string::npos; at = text.find("@ID@", at)) {
-    text.replace(at, 4, id);
+std::string ReplaceAll(std::string text, const std::string& from, const std::string& to) {
+  for (size_t at = text.find(from); at != std::string::npos; at = text.find(from, at + to.size())) {
+    text.replace(at, from.size(), to);
   }
   return text;
+}
+
+std::string WithId(const std::string& text, const std::string& id) {
+  return ReplaceAll(text, "@ID@", id);
 }
 
 TEST_F(UpsertCompoundTest, ACompoundStoresAndAnswersWhatSingleUpsertsDo) {
@@ -104,6 +110,66 @@ TEST_F(UpsertCompoundTest, ACompoundStoresAndAnswersWhatSingleUpsertsDo) {
   }
   EXPECT_EQ(std::vector<std::string>{"/v/s/b.txt"},
             Found(R"({"text": "hello", "id": "fileindex_s"})"));
+}
+
+// Random compounds of upserts and other requests, well and badly formed:
+// both paths answer and store the same, whatever each sub-request holds.
+TEST_F(UpsertCompoundTest, RandomCompoundsAnswerAsTheValueTreeDoes) {
+  const std::vector<std::string> values = {R"("x")",
+                                           R"("Ünï\u00e9")",
+                                           "0",
+                                           "-7",
+                                           "9223372036854775807",
+                                           "18446744073709551615",
+                                           "1.5",
+                                           "3.0",
+                                           "true",
+                                           "null",
+                                           R"(["a","b"])",
+                                           R"({"k":1})",
+                                           R"([1])",
+                                           R"("")"};
+  const std::vector<std::string> keys = {
+      "KALOMDPath",        "KALOMDFSName",         "KALOMDFSSize",
+      "KALOMDIsDir",       "KALOMDTitle",          "KALOMDTextContent",
+      "KALOMDOwnerUserID", "KALOMDDurationSecond", "other"};
+  std::mt19937 random(42);
+  auto pick = [&random](const std::vector<std::string>& from) {
+    return from[random() % from.size()];
+  };
+  for (int round = 0; round < 40; ++round) {
+    std::string compound = R"({"compound":[)";
+    for (int i = 0; i < 12; ++i) {
+      const std::string path = "/v/s/f" + std::to_string(random() % 20);
+      std::string doc = "{";
+      if (random() % 4 != 0) doc += R"("KALOMDPath":")" + path + "\",";
+      for (int k = random() % 5; k > 0; --k) doc += "\"" + pick(keys) + "\":" + pick(values) + ",";
+      doc += R"("KALOMDFSName":"n")" + std::string("}");
+      switch (random() % 8) {
+        case 0:
+          compound +=
+              R"({"command":"document_del_by_id","data":{"id":"@ID@","doc_id":")" + path + "\"}}";
+          break;
+        case 1:
+          compound += R"({"command":"document_upsert_by_id","data":{"id":"@ID@","doc_id":)" +
+                      pick(values) + R"(,"data":)" + doc + "}}";
+          break;
+        default:
+          compound += UpsertText(path, doc);
+      }
+      compound += ",";
+    }
+    compound += R"({"command":"commit","data":{"id":"@ID@"}}]})";
+    const std::string fast_text = WithId(compound, kId), tree_text = WithId(compound, kOther);
+    const std::optional<Json::Value> fast = engine_->HandleCompound(fast_text, search::Caller{});
+    ASSERT_TRUE(fast) << fast_text;
+    const Json::Value tree = engine_->Handle(ParseJson(tree_text), search::Caller{}, tree_text);
+    // The other index's id and database path, as this one's.
+    ASSERT_EQ(ReplaceAll(ReplaceAll(toString(tree), kOther, kId), "volume1/t/", "volume1/s/"),
+              toString(*fast))
+        << compound;
+  }
+  EXPECT_EQ(Everything(kOther), Everything(kId));
 }
 
 // Every other sub-request is read on its own and carried out as Compound()
