@@ -25,15 +25,20 @@ namespace {
 // The parser keeps about 14 bytes for each byte of the largest text it has
 // read: larger requests (text content, mostly) take the other path.
 constexpr size_t kMaxText = size_t{1} << 20;
-// More properties than this make a document unusual: the other path.
+// An object of more members than this (a document, a request) is unusual:
+// the other path.
 constexpr size_t kMaxProperties = 64;
 constexpr char kUpsert[] = "document_upsert_by_id";
 
 using simdjson::dom::element_type;
 
+// Whether object's keys differ, checked for small objects only (a request
+// has a few): a large one counts as repeating them, which sends it to the
+// other path, so that no request costs a quadratic check.
 bool UniqueKeys(const simdjson::dom::object& object) {
   std::vector<std::string_view> keys;
   for (const auto field : object) {
+    if (keys.size() == kMaxProperties) return false;
     if (std::find(keys.begin(), keys.end(), field.key) != keys.end()) return false;
     keys.push_back(field.key);
   }

@@ -172,6 +172,14 @@ TEST_F(UpsertCompoundTest, RandomCompoundsAnswerAsTheValueTreeDoes) {
   EXPECT_EQ(Everything(kOther), Everything(kId));
 }
 
+// An upsert whose request has more members than anyone sends.
+std::string ManyKeys() {
+  std::string request = R"({"command":"document_upsert_by_id",)";
+  for (int k = 0; k < 100; ++k)
+    request += "\"k" + std::to_string(k) + "\":" + std::to_string(k) + ",";
+  return request + R"("data":{"id":"@ID@","doc_id":"/v/s/m","data":{"KALOMDPath":"/v/s/m"}}})";
+}
+
 // Every other sub-request is read on its own and carried out as Compound()
 // does, in its turn; a request this path cannot read whole is left alone.
 TEST_F(UpsertCompoundTest, OtherSubRequestsAnswerAsTheValueTreeDoes) {
@@ -184,7 +192,7 @@ TEST_F(UpsertCompoundTest, OtherSubRequestsAnswerAsTheValueTreeDoes) {
       R"({"compound":[]},5,{"command":"nope","data":{}},)"
       R"({"command":"document_upsert_by_id","command":"document_upsert_by_id",)"
       R"("data":{"id":"@ID@","doc_id":"/v/s/c","data":{"KALOMDPath":"/v/s/c"}}},)" +
-      UpsertText("", R"({"KALOMDPath":"/v/s/d"})", "fileindex_nothere") + "]}";
+      UpsertText("", R"({"KALOMDPath":"/v/s/d"})", "fileindex_nothere") + "," + ManyKeys() + "]}";
   Json::Value fast = AskText(WithId(compound, kId));
   const std::string other = WithId(compound, kOther);
   Json::Value tree =
