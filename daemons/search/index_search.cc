@@ -296,8 +296,20 @@ struct Sample {
   int64_t estimate = 0;  // of the matches in the whole index
   int64_t matches = 0;   // in the sample
   int64_t starting = 0;  // of those, the names that begin with the fragment
+  std::string names;     // the names read, each ended by a NUL (no name holds one)
 
   bool AllStart() const { return matches > 0 && starting == matches; }
+  // How many of the names read hold part.
+  int64_t Holding(std::string_view part) const {
+    int64_t count = 0;
+    size_t next_name = 0;  // a name is counted once, however often it holds part
+    for (size_t at = names.find(part); at != std::string::npos; at = names.find(part, at + 1)) {
+      if (at < next_name) continue;
+      ++count;
+      next_name = names.find('\0', at) + 1;
+    }
+    return count;
+  }
 };
 
 Sample SampleNames(SqliteDb& db, const std::string& folded) {
@@ -309,7 +321,9 @@ Sample SampleNames(SqliteDb& db, const std::string& folded) {
     stretch.Bind(1, last / kSampleStretches * k).Bind(2, kSampleStretch);
     while (stretch.Step()) {
       ++read;
-      const size_t at = stretch.TextView(0).find(folded);
+      const std::string_view name = stretch.TextView(0);
+      sample.names.append(name).push_back('\0');
+      const size_t at = name.find(folded);
       sample.matches += at != std::string_view::npos;
       sample.starting += at == 0;
     }
@@ -393,6 +407,28 @@ std::vector<SearchHit> StartingPage(SqliteDb& db, const SearchQuery& q, const st
   return hits;
 }
 
+// A part of folded, three or four code points long, that the sampled names
+// hold no more often than folded itself: names holding folded are among
+// those holding the part, so when name_grams finds no more of those than
+// names that begin with folded, no name holds it further in. A short part
+// reads one or two trigrams' entries, the whole fragment all of them.
+// Empty when no part looks like that.
+std::string ProbeFor(const Sample& sample, const std::string& folded) {
+  std::vector<size_t> starts;  // of folded's code points, and its end
+  for (size_t i = 0; i < folded.size(); ++i) {
+    if ((static_cast<unsigned char>(folded[i]) & 0xC0) != 0x80) starts.push_back(i);
+  }
+  starts.push_back(folded.size());
+  const size_t code_points = starts.size() - 1;
+  for (size_t length = kTrigram; length <= kTrigram + 1 && length < code_points; ++length) {
+    for (size_t first = code_points - length + 1; first-- > 0;) {
+      const std::string part = folded.substr(starts[first], starts[first + length] - starts[first]);
+      if (sample.Holding(part) <= sample.matches) return part;
+    }
+  }
+  return std::string();
+}
+
 // The page of a fragment of three code points or more read as two parts:
 // the names that begin with it, from their stretch of the name index, and
 // the names that hold it further in, from name_grams ("^" anchors a phrase
@@ -400,7 +436,7 @@ std::vector<SearchHit> StartingPage(SqliteDb& db, const SearchQuery& q, const st
 // most of the matches: nullopt when it is not. matches is the fragment's
 // count when it is known exactly, or nullopt when it passed the bound.
 std::optional<SearchResult> ByStart(SqliteDb& db, const SearchQuery& q, const std::string& folded,
-                                    std::optional<int64_t> matches) {
+                                    std::optional<int64_t> matches, const Sample& sample) {
   const int64_t starting = CountStarting(db, folded, matches ? *matches : kMaxCountBound + 1);
   const std::string match = NameMatch(folded);
   int64_t inside = 0;
@@ -410,12 +446,16 @@ std::optional<SearchResult> ByStart(SqliteDb& db, const SearchQuery& q, const st
     // Counting the matches on past the starting ones tells how many lie
     // further in; when many do, the walk finds them sooner.
     if (starting > kMaxCountBound) return std::nullopt;
-    Filter by_name;
-    by_name.text_args.push_back(match);
-    inside = CountUpTo(db, " FROM name_grams WHERE name_grams MATCH ?", by_name,
-                       starting + kCountBound) -
-             starting;
-    if (inside >= kCountBound) return std::nullopt;
+    auto count = [&db](const std::string& phrase, int64_t bound) {
+      Filter by_name;
+      by_name.text_args.push_back(phrase);
+      return CountUpTo(db, " FROM name_grams WHERE name_grams MATCH ?", by_name, bound);
+    };
+    const std::string probe = ProbeFor(sample, folded);
+    if (probe.empty() || count(NameMatch(probe), starting + 1) > starting) {
+      inside = count(match, starting + kCountBound) - starting;
+      if (inside >= kCountBound) return std::nullopt;
+    }
   }
   if (starting < inside) return std::nullopt;
   SearchResult result;
@@ -450,7 +490,7 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
   if (CodePointCount(folded) >= kTrigram) {
     const Sample sample = SampleNames(db, folded);
     if (sample.AllStart()) {
-      if (auto split = ByStart(db, q, folded, std::nullopt)) return *split;
+      if (auto split = ByStart(db, q, folded, std::nullopt, sample)) return *split;
     }
     // A fragment the sample finds in many names goes to the walk: its total
     // is a bound either way, and counting it to the walk's bound would cost
@@ -459,7 +499,7 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
     const int64_t count_to = common ? std::max(kCountBound, q.offset + q.limit) : bound;
     result.total = CountUpTo(db, grams, by_name, count_to);
     if (result.total < count_to) {
-      if (auto split = ByStart(db, q, folded, result.total)) return *split;
+      if (auto split = ByStart(db, q, folded, result.total, sample)) return *split;
       result.hits = SortedNameMatches(db, q, match);
       return result;
     }
