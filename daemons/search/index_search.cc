@@ -263,6 +263,14 @@ int64_t CountUpTo(SqliteDb& db, const std::string& from_where, const Filter& f, 
   return count.Int(0);
 }
 
+// The names that name_grams finds for phrase (a NameMatch), counted up to
+// bound.
+int64_t CountNameMatches(SqliteDb& db, const std::string& phrase, int64_t bound) {
+  Filter by_name;
+  by_name.text_args.push_back(phrase);
+  return CountUpTo(db, " FROM name_grams WHERE name_grams MATCH ?", by_name, bound);
+}
+
 int64_t LastId(SqliteDb& db) {
   Statement last(db, "SELECT max(id) FROM documents");  // the row count, near enough
   last.Step();
@@ -296,7 +304,7 @@ struct Sample {
   int64_t estimate = 0;  // of the matches in the whole index
   int64_t matches = 0;   // in the sample
   int64_t starting = 0;  // of those, the names that begin with the fragment
-  std::string names;     // the names read, each ended by a NUL (no name holds one)
+  std::string names;     // when kept: the names read, each ended by a NUL (no name holds one)
 
   bool AllStart() const { return matches > 0 && starting == matches; }
   // How many of the names read hold part.
@@ -312,7 +320,8 @@ struct Sample {
   }
 };
 
-Sample SampleNames(SqliteDb& db, const std::string& folded) {
+// keep_names keeps the names read, for ProbeFor().
+Sample SampleNames(SqliteDb& db, const std::string& folded, bool keep_names) {
   const int64_t last = LastId(db);
   Statement stretch(db, "SELECT folded_name FROM documents WHERE id >= ?1 ORDER BY id LIMIT ?2");
   int64_t read = 0;
@@ -322,7 +331,7 @@ Sample SampleNames(SqliteDb& db, const std::string& folded) {
     while (stretch.Step()) {
       ++read;
       const std::string_view name = stretch.TextView(0);
-      sample.names.append(name).push_back('\0');
+      if (keep_names) sample.names.append(name).push_back('\0');
       const size_t at = name.find(folded);
       sample.matches += at != std::string_view::npos;
       sample.starting += at == 0;
@@ -446,14 +455,9 @@ std::optional<SearchResult> ByStart(SqliteDb& db, const SearchQuery& q, const st
     // Counting the matches on past the starting ones tells how many lie
     // further in; when many do, the walk finds them sooner.
     if (starting > kMaxCountBound) return std::nullopt;
-    auto count = [&db](const std::string& phrase, int64_t bound) {
-      Filter by_name;
-      by_name.text_args.push_back(phrase);
-      return CountUpTo(db, " FROM name_grams WHERE name_grams MATCH ?", by_name, bound);
-    };
     const std::string probe = ProbeFor(sample, folded);
-    if (probe.empty() || count(NameMatch(probe), starting + 1) > starting) {
-      inside = count(match, starting + kCountBound) - starting;
+    if (probe.empty() || CountNameMatches(db, NameMatch(probe), starting + 1) > starting) {
+      inside = CountNameMatches(db, match, starting + kCountBound) - starting;
       if (inside >= kCountBound) return std::nullopt;
     }
   }
@@ -483,12 +487,9 @@ int64_t WalkBudget(int64_t estimated_matches, int64_t bound) {
 SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& folded) {
   const int64_t bound = CountBound(db, q.offset + q.limit);
   const std::string match = NameMatch(folded);
-  Filter by_name;
-  by_name.text_args.push_back(match);
-  const std::string grams = " FROM name_grams WHERE name_grams MATCH ?";
   SearchResult result;
   if (CodePointCount(folded) >= kTrigram) {
-    const Sample sample = SampleNames(db, folded);
+    const Sample sample = SampleNames(db, folded, /*keep_names=*/true);
     if (sample.AllStart()) {
       if (auto split = ByStart(db, q, folded, std::nullopt, sample)) return *split;
     }
@@ -497,7 +498,7 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
     // about as much as the walk.
     const bool common = sample.estimate >= kCommonFactor * bound;
     const int64_t count_to = common ? std::max(kCountBound, q.offset + q.limit) : bound;
-    result.total = CountUpTo(db, grams, by_name, count_to);
+    result.total = CountNameMatches(db, match, count_to);
     if (result.total < count_to) {
       if (auto split = ByStart(db, q, folded, result.total, sample)) return *split;
       result.hits = SortedNameMatches(db, q, match);
@@ -510,7 +511,8 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
   }
   // A prefix query gathers every match before its first row: only for
   // fragments that look rare, or whose matches the walk did not reach.
-  if (const int64_t estimate = SampleNames(db, folded).estimate; estimate >= bound) {
+  if (const int64_t estimate = SampleNames(db, folded, /*keep_names=*/false).estimate;
+      estimate >= bound) {
     // Counting on once the page is full reads entries for the total alone:
     // a short fragment is common, and its total is a bound anyway.
     const int64_t count_to = std::max(kCountBound, q.offset + q.limit);
@@ -522,7 +524,7 @@ SearchResult NameInOrder(SqliteDb& db, const SearchQuery& q, const std::string& 
       return result;
     }
   }
-  result.total = CountUpTo(db, grams, by_name, bound);
+  result.total = CountNameMatches(db, match, bound);
   result.exact = result.total < bound;
   result.hits = SortedNameMatches(db, q, match);
   return result;

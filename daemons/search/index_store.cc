@@ -240,39 +240,39 @@ class ValueFields {
 // a value tree).
 class FlatFields {
  public:
+  using Kind = FlatDocument::Kind;
   explicit FlatFields(const FlatDocument& doc) : doc_(doc) {}
 
-  bool IsString(const char* key) const {
-    const FlatDocument::Property* p = Find(key);
-    return p != nullptr && p->kind == FlatDocument::Kind::kString;
-  }
+  bool IsString(const char* key) const { return Of(key, Kind::kString) != nullptr; }
   std::string String(const char* key) const {
-    return IsString(key) ? std::string(Find(key)->text) : std::string();
+    const FlatDocument::Property* p = Of(key, Kind::kString);
+    return p != nullptr ? std::string(p->text) : std::string();
   }
   bool True(const char* key) const {
-    const FlatDocument::Property* p = Find(key);
-    return p != nullptr && p->kind == FlatDocument::Kind::kBool && p->flag;
+    const FlatDocument::Property* p = Of(key, Kind::kBool);
+    return p != nullptr && p->flag;
   }
   std::optional<int64_t> Int(const char* key) const {
-    const FlatDocument::Property* p = Find(key);
-    if (p == nullptr || p->kind != FlatDocument::Kind::kInt) return std::nullopt;
+    const FlatDocument::Property* p = Of(key, Kind::kInt);
+    if (p == nullptr) return std::nullopt;
     return p->number;
   }
   std::string Owner() const {
-    const FlatDocument::Property* p = Find("KALOMDOwnerUserID");
-    if (p != nullptr && p->kind == FlatDocument::Kind::kInt) return std::to_string(p->number);
-    return String("KALOMDOwnerUserID");
+    const FlatDocument::Property* p = Of("KALOMDOwnerUserID", Kind::kInt);
+    return p != nullptr ? std::to_string(p->number) : String("KALOMDOwnerUserID");
   }
   void AppendWords(const std::string& key, std::string& out) const {
-    if (!IsString(key.c_str())) return;
+    const FlatDocument::Property* p = Of(key.c_str(), Kind::kString);
+    if (p == nullptr) return;
     if (!out.empty()) out += '\n';
-    out += Find(key.c_str())->text;
+    out += p->text;
   }
 
  private:
-  const FlatDocument::Property* Find(std::string_view key) const {
+  // The property key names last, when it is of kind.
+  const FlatDocument::Property* Of(std::string_view key, Kind kind) const {
     for (auto p = doc_.properties.rbegin(); p != doc_.properties.rend(); ++p) {
-      if (p->name == key) return &*p;
+      if (p->name == key) return p->kind == kind ? &*p : nullptr;
     }
     return nullptr;
   }

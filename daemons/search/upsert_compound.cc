@@ -76,7 +76,7 @@ std::optional<Upsert> UpsertOf(const simdjson::dom::element& item) {
 }
 
 // doc's properties when each is a string, a whole number that fits 64
-// bits, a boolean or null; false otherwise.
+// bits, a boolean or null; false otherwise. flat.text is left as it is.
 bool Flatten(const simdjson::dom::object& doc, FlatDocument& flat) {
   using Kind = FlatDocument::Kind;
   flat.properties.clear();
@@ -104,7 +104,6 @@ bool Flatten(const simdjson::dom::object& doc, FlatDocument& flat) {
     }
     flat.properties.push_back(p);
   }
-  flat.text = simdjson::minify(doc);
   return true;
 }
 
@@ -112,19 +111,24 @@ bool Flatten(const simdjson::dom::object& doc, FlatDocument& flat) {
 // it can be.
 void WriteFlat(IndexStore& store, const Upsert& upsert, FlatDocument& flat) {
   const std::string doc_id(upsert.doc_id);
+  flat.text = simdjson::minify(upsert.doc);
   if (Flatten(upsert.doc, flat) && store.UpsertFlat(doc_id, flat)) return;
   // The document's value after all: Upsert() of what Handle() parses.
-  const std::string doc_text = simdjson::minify(upsert.doc);
   Json::Value doc;
-  if (!fromString(doc, doc_text)) throw SearchError(kBadJson, "unreadable document");
-  store.Upsert(doc_id, doc, doc_text);
+  if (!fromString(doc, flat.text)) throw SearchError(kBadJson, "unreadable document");
+  store.Upsert(doc_id, doc, flat.text);
 }
 
 }  // namespace
 
 std::optional<Json::Value> SearchEngine::HandleCompound(std::string_view text,
                                                         const Caller& caller) {
-  if (text.size() > kMaxText) return std::nullopt;
+  // Searches and the other single requests are parsed once, by Handle()'s
+  // caller. (A key spelled with escapes goes that way too, and is read as
+  // well there.)
+  if (text.size() > kMaxText || text.find("\"compound\"") == std::string_view::npos) {
+    return std::nullopt;
+  }
   thread_local simdjson::dom::parser parser;
   simdjson::dom::object root;
   simdjson::dom::array items;
