@@ -117,6 +117,7 @@ TEST_F(UpsertCompoundTest, ACompoundStoresAndAnswersWhatSingleUpsertsDo) {
 TEST_F(UpsertCompoundTest, RandomCompoundsAnswerAsTheValueTreeDoes) {
   const std::vector<std::string> values = {R"("x")",
                                            R"("Ünï\u00e9")",
+                                           R"("q\"b\\s\/\b\f\n\r\t\u0001\u001f\u007f")",
                                            "0",
                                            "-7",
                                            "9223372036854775807",
