@@ -36,6 +36,7 @@
 #include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <memory>
 #include <random>
 #include <stdexcept>
 #include <string>
@@ -179,18 +180,27 @@ class Daemon {
   pid_t pid() const { return pid_; }
 
   // One request on a fresh connection, as the library's client sends it.
-  Json::Value Ask(const std::string& request) {
-    kalodaemon::DomainSockConnection connection(socket_);
+  Json::Value Ask(const std::string& request) { return Await(Send(request)); }
+  Json::Value Ask(const Json::Value& request) { return Ask(orvex::toString(request)); }
+
+  // Ask() in two halves, for a client that prepares its next request while
+  // the daemon carries out this one.
+  std::unique_ptr<kalodaemon::DomainSockConnection> Send(const std::string& request) {
+    auto connection = std::make_unique<kalodaemon::DomainSockConnection>(socket_);
+    if (!connection->Connect() || !connection->Send(request)) {
+      throw std::runtime_error("cannot send a request: " + std::string(std::strerror(errno)));
+    }
+    return connection;
+  }
+  static Json::Value Await(std::unique_ptr<kalodaemon::DomainSockConnection> connection) {
     std::string answer_text;
     Json::Value answer;
-    if (!connection.Connect() || !connection.Send(request) || !connection.Recv(answer_text) ||
-        !orvex::fromString(answer, answer_text) || !answer["success"].asBool() ||
-        answer["has_fail"].asBool()) {
+    if (!connection->Recv(answer_text) || !orvex::fromString(answer, answer_text) ||
+        !answer["success"].asBool() || answer["has_fail"].asBool()) {
       throw std::runtime_error("request failed: " + answer_text.substr(0, 500));
     }
     return answer;
   }
-  Json::Value Ask(const Json::Value& request) { return Ask(orvex::toString(request)); }
 
  private:
   std::string socket_;
@@ -212,18 +222,26 @@ double Load(Daemon& daemon, const Share& share, const std::vector<int>& indexes,
   const std::string commit = orvex::toString(Command("commit"));
   const Clock::time_point start = Clock::now();
   int since_commit = 0;
-  std::string request;
-  for (size_t first = 0; first < indexes.size(); first += kCompoundSize) {
-    request = R"({"compound":[)";
+  // The indexer has its next batch at hand when an answer comes: the next
+  // compound is written while the daemon carries out this one.
+  std::string request, next;
+  auto write_compound = [&](size_t first, std::string& out) {
+    out = R"({"compound":[)";
     const size_t end = std::min(indexes.size(), first + kCompoundSize);
     for (size_t k = first; k < end; ++k) {
-      if (k != first) request += ',';
+      if (k != first) out += ',';
       const int i = indexes[k];
-      const std::string* text = text_of(i);
-      AppendUpsert(request, share.paths[i], share.names[i], i, text);
+      AppendUpsert(out, share.paths[i], share.names[i], i, text_of(i));
     }
-    request += "]}";
-    daemon.Ask(request);
+    out += "]}";
+  };
+  if (!indexes.empty()) write_compound(0, next);
+  for (size_t first = 0; first < indexes.size(); first += kCompoundSize) {
+    const size_t end = std::min(indexes.size(), first + kCompoundSize);
+    request.swap(next);
+    auto in_flight = daemon.Send(request);
+    if (end < indexes.size()) write_compound(end, next);
+    Daemon::Await(std::move(in_flight));
     since_commit += static_cast<int>(end - first);
     if (since_commit >= commit_every) {
       daemon.Ask(commit);
