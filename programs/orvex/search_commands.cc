@@ -1,6 +1,8 @@
 // `orvex search` and `orvex stats`: users' searches and the indexes' figures,
 // asked of the search daemon kaloelasticd on its socket (under ORVEX_ROOT).
 // The daemon trims a search to what the asking user may read.
+#include <unistd.h>
+
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -20,20 +22,22 @@ namespace {
 constexpr char kSearchSocketPath[] = "/var/run/kaloelasticd.sock";
 
 constexpr char kSearchUsage[] =
-    "usage: orvex search [FRAGMENT] [--text WORDS] [--type TYPE] [--ext EXT]\n"
-    "                    [--folder PATH] [--sort KEY] [--desc] [--limit N] [--offset N]\n"
-    "                    [--share NAME] [--user NAME] [--json]\n"
-    "Searches the indexed shares. FRAGMENT matches anywhere in file names, in any\n"
-    "letter case. Prints one line per hit: type, size, path (and the matched text).\n"
-    "  --text WORDS   words, \"phrases\" and prefix* in the files' text and metadata\n"
-    "  --type TYPE    dir, document, audio, video, image or other\n"
-    "  --ext EXT      only this extension\n"
-    "  --folder PATH  only below this full path\n"
-    "  --sort KEY     name (default), path, size, mtime or relevance; --desc reverses\n"
-    "  --limit N      at most N hits (default 50, at most 1000); --offset N skips N\n"
-    "  --share NAME   only this share's index\n"
-    "  --user NAME    (root) search as this user would see\n"
-    "  --json         print the daemon's answer as JSON\n";
+    "usage: orvex search [QUERY] [--name FRAGMENT] [--type TYPE] [--ext EXT]\n"
+    "                    [--in FOLDER] [--share NAME] [--sort KEY] [--desc]\n"
+    "                    [--limit N] [--offset N] [--user NAME] [--json]\n"
+    "Searches the indexed shares. QUERY is words, \"phrases\", prefix*, OR and\n"
+    "-excluded words in the files' text and metadata; each hit shows its matched\n"
+    "words. Prints one line per hit: type, size, path (and the matched text).\n"
+    "  --name FRAGMENT  a piece of the file name, anywhere in it, in any letter case\n"
+    "  --type TYPE      dir, document, audio, video, image or other\n"
+    "  --ext EXT        only this extension\n"
+    "  --in FOLDER      only below this full path\n"
+    "  --share NAME     only this share's index\n"
+    "  --sort KEY       name (default; relevance with QUERY), path, size or mtime;\n"
+    "                   --desc reverses\n"
+    "  --limit N        at most N hits (default 50, at most 1000); --offset N skips N\n"
+    "  --user NAME      (root) search as this user would see\n"
+    "  --json           print the daemon's answer as JSON\n";
 
 constexpr char kStatsUsage[] =
     "usage: orvex stats [--json]\n"
@@ -58,8 +62,8 @@ Json::Value ParseSearch(const Args& args, bool& json) {
   static const struct {
     const char* option;
     const char* member;
-  } kText[] = {{"--text", "text"},     {"--type", "type"}, {"--ext", "extension"},
-               {"--folder", "folder"}, {"--sort", "sort"}, {"--user", "user"}};
+  } kText[] = {{"--name", "name"}, {"--type", "type"}, {"--ext", "extension"},
+               {"--in", "folder"}, {"--sort", "sort"}, {"--user", "user"}};
   for (size_t i = 0; i < args.size(); ++i) {
     const std::string& arg = args[i];
     auto value = [&]() -> std::string {
@@ -84,13 +88,40 @@ Json::Value ParseSearch(const Args& args, bool& json) {
       data["id"] = "fileindex_" + value();
     } else if (arg.size() > 1 && arg[0] == '-') {
       throw UsageError("unknown option " + arg, kSearchUsage);
-    } else if (data.isMember("name")) {
-      throw UsageError("unexpected word " + arg + " (one FRAGMENT only)", kSearchUsage);
+    } else if (data.isMember("text")) {
+      throw UsageError("unexpected word " + arg + " (quote a QUERY of several words)",
+                       kSearchUsage);
     } else {
-      data["name"] = arg;
+      data["text"] = arg;
     }
   }
+  // Words are looked for to find the files most about them first.
+  if (data.isMember("text") && !data.isMember("sort")) data["sort"] = "relevance";
   return data;
+}
+
+// A snippet on one line: the file's own control characters (line breaks,
+// and escape sequences that could drive the terminal) become spaces. On a
+// terminal the matched words, which the daemon puts in brackets, are shown
+// in bold instead; a bracket inside a match, or a closing one outside, is
+// the file's own.
+std::string ShownSnippet(const std::string& snippet, bool terminal) {
+  std::string out;
+  out.reserve(snippet.size() + 32);
+  bool bold = false;
+  for (const char c : snippet) {
+    const auto byte = static_cast<unsigned char>(c);
+    if (byte < 0x20 || byte == 0x7F) {
+      out += ' ';
+    } else if (terminal && c == (bold ? ']' : '[')) {
+      out += bold ? "\x1b[0m" : "\x1b[1m";
+      bold = !bold;
+    } else {
+      out += c;
+    }
+  }
+  if (bold) out += "\x1b[0m";
+  return out;
 }
 
 std::string Field(const Json::Value& value) {
@@ -113,9 +144,12 @@ int RunSearchCommand(const Args& args) {
     std::cout << orvex::toString(data) << "\n";
     return kExitOk;
   }
+  const bool terminal = ::isatty(STDOUT_FILENO) != 0;
   for (const Json::Value& hit : data["hits"]) {
     std::cout << Field(hit["type"]) << "\t" << Field(hit["size"]) << "\t" << Field(hit["path"]);
-    if (hit.isMember("snippet")) std::cout << "\t" << hit["snippet"].asString();
+    if (hit.isMember("snippet")) {
+      std::cout << "\t" << ShownSnippet(hit["snippet"].asString(), terminal);
+    }
     std::cout << "\n";
   }
   std::cout << data["hits"].size() << " of " << Field(data["total"]) << " hits\n";

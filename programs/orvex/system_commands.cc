@@ -54,8 +54,8 @@ constexpr char kIndexUsage[] =
     "registered share holds it (named after the directory), adds it as an indexed\n"
     "folder, and waits with a progress bar until the indexing daemon has indexed\n"
     "it. The daemons must be running (orvex up). --timeout gives up waiting after\n"
-    "SECONDS (the indexing goes on). Then: orvex search FRAGMENT, orvex search\n"
-    "--text WORDS.\n";
+    "SECONDS (the indexing goes on). Then: orvex search --name FRAGMENT, orvex\n"
+    "search WORDS.\n";
 
 constexpr char kIndexSocketPath[] = "/var/run/fileindexd.sock";
 constexpr char kIndexDaemon[] = "the indexing daemon fileindexd";
@@ -355,7 +355,7 @@ int Index(const Args& args) {
               << "` waits again\n";
     return kExitOk;
   }
-  std::cout << dir << " is searchable: orvex search FRAGMENT, orvex search --text WORDS\n";
+  std::cout << dir << " is searchable: orvex search --name FRAGMENT, orvex search WORDS\n";
   return kExitOk;
 }
 

@@ -25,13 +25,13 @@ class WholeSystemTest : public ProgramTest {
     Run({"down"});
   }
 
-  // The output of `orvex search FRAGMENT`, once it contains wanted (or the
+  // The output of `orvex search --name FRAGMENT`, once it contains wanted (or the
   // last output after a minute): the index follows the disk within moments.
   std::string SearchUntil(const std::string& fragment, const std::string& wanted) {
     ProgramOutcome outcome;
     WaitUntil(
         [&] {
-          outcome = Run({"search", fragment});
+          outcome = Run({"search", "--name", fragment});
           return outcome.out.find(wanted) != std::string::npos;
         },
         std::chrono::seconds(60), std::chrono::milliseconds(100));
@@ -41,7 +41,7 @@ class WholeSystemTest : public ProgramTest {
   std::string MakeTree() {
     const std::string dir = io_.Join("library");
     std::filesystem::create_directories(dir + "/notes/@eaDir");
-    std::ofstream(dir + "/notes/Straße.txt") << "a walk along the riverside promenade\n";
+    std::ofstream(dir + "/notes/Straße.txt") << "a walk along the riverside\npromenade\n";
     std::ofstream(dir + "/notes/@eaDir/hidden.txt") << "metadata, never a document\n";
     std::ofstream(dir + "/readme.md") << "# Library\nnothing about rivers here\n";
     return dir;
@@ -68,12 +68,14 @@ TEST_F(WholeSystemTest, IndexedDirectoryIsSearchableByNameAndTextAndFollowsChang
   EXPECT_NE(std::string::npos, status.find("share library: idle, 4 documents indexed")) << status;
 
   // Full case folding: "STRASSE" finds "Straße".
-  const std::string by_name = Run({"search", "STRASSE"}).out;
+  const std::string by_name = Run({"search", "--name", "STRASSE"}).out;
   EXPECT_NE(std::string::npos, by_name.find(dir + "/notes/Straße.txt")) << by_name;
-  const std::string by_text = Run({"search", "--text", "riverside"}).out;
-  EXPECT_NE(std::string::npos, by_text.find("Straße.txt")) << by_text;
+  // One line per hit, the matched word marked, the file's line break gone.
+  const std::string by_text = Run({"search", "riverside"}).out;
+  EXPECT_NE(std::string::npos, by_text.find("Straße.txt\ta walk along the [riverside] promenade\n"))
+      << by_text;
   EXPECT_EQ(std::string::npos, by_text.find("readme.md")) << by_text;
-  EXPECT_EQ(std::string::npos, Run({"search", "hidden"}).out.find("hidden.txt"));
+  EXPECT_EQ(std::string::npos, Run({"search", "--name", "hidden"}).out.find("hidden.txt"));
 
   // A change after the first index reaches the search through the watcher.
   std::ofstream(dir + "/notes/zebra-crossing.txt") << "stripes\n";
@@ -85,7 +87,7 @@ TEST_F(WholeSystemTest, IndexedDirectoryIsSearchableByNameAndTextAndFollowsChang
   const ProgramOutcome down = Run({"down"});
   EXPECT_EQ(0, down.status) << down.err;
   EXPECT_NE(std::string::npos, down.out.find("kaloelasticd: stopped")) << down.out;
-  const ProgramOutcome after = Run({"search", "zebra"});
+  const ProgramOutcome after = Run({"search", "--name", "zebra"});
   EXPECT_EQ(2, after.status);
   EXPECT_NE(std::string::npos, after.err.find("start the daemons: orvex up")) << after.err;
 }

@@ -217,12 +217,15 @@ TEST_F(KaloelasticdTest, TheToolSearchesAndShowsStats) {
                          R"({"KALOMDFSSize": 42, "KALOMDTextContent": "a wonderful day"})")));
   Ok(Upsert(kId, FileDoc("/v/s/other.txt")));
   Ok(Command("commit", kId));
-  run = tool({"search", "STRASSE"});
+  run = tool({"search", "--name", "STRASSE"});
   EXPECT_EQ(0, run.status) << run.err;
   EXPECT_EQ("document\t42\t/v/s/Straße.txt\n1 of 1 hits\n", run.out);
-  run = tool({"search", "--text", "wonder*", "--json"});
+  run = tool({"search", "wonder*", "--json"});
   EXPECT_EQ(0, run.status) << run.err;
   EXPECT_EQ("a [wonderful] day", ParseJson(run.out)["hits"][0]["snippet"].asString());
+  run = tool({"search", "wonderful", "day"});
+  EXPECT_EQ(2, run.status);
+  EXPECT_NE(std::string::npos, run.err.find("quote a QUERY of several words")) << run.err;
   run = tool({"stats"});
   EXPECT_EQ(0, run.status) << run.err;
   EXPECT_EQ("fileindex_s\t2 documents\t", run.out.substr(0, 24)) << run.out;
