@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <chrono>
 #include <filesystem>
 #include <system_error>
 
@@ -378,11 +379,13 @@ struct IndexStore::Statements {
                     "INSERT INTO words(rowid, text, props) SELECT c.id, c.text, c.props "
                     "FROM unindexed_words u JOIN contents c ON c.id = u.id ORDER BY u.id"),
         forget_words(w, "DELETE FROM unindexed_words"),
+        note_commit(w, "INSERT OR REPLACE INTO meta(key, value) VALUES ('last_commit', ?1)"),
         commit(w, "COMMIT"),
         rollback(w, "ROLLBACK") {}
   Statement find, load, insert, insert_new, update, insert_content, update_content, remove_content,
       remove, remove_prefix, get_prefix, begin, last_id, mark_new, savepoint, release, rollback_to,
-      index_names, forget_names, forget_new, index_words, forget_words, commit, rollback;
+      index_names, forget_names, forget_new, index_words, forget_words, note_commit, commit,
+      rollback;
 };
 
 IndexStore::IndexStore(const std::string& path, bool create) : path_(path) {
@@ -483,6 +486,10 @@ void IndexStore::Commit() {
   st_->forget_new.Run();
   st_->index_words.Run();
   st_->forget_words.Run();
+  const auto now = std::chrono::system_clock::now().time_since_epoch();
+  st_->note_commit.Bind(
+      1, std::to_string(std::chrono::duration_cast<std::chrono::seconds>(now).count()));
+  st_->note_commit.Run();
   st_->commit.Run();
 }
 
@@ -769,6 +776,9 @@ Json::Value IndexStore::Stats() {
   }
   out["bytes"] = static_cast<Json::Int64>(bytes);
   out["uncommitted"] = InTransaction();
+  Statement last(*reader_, "SELECT value FROM meta WHERE key = 'last_commit'");
+  out["last_commit"] =
+      last.Step() ? Json::Value(static_cast<Json::Int64>(last.Int(0))) : Json::Value();
   return out;
 }
 

@@ -126,7 +126,8 @@ class IndexStore {
   // exact or a lower bound. Only committed documents.
   SearchResult Search(const SearchQuery& query);
 
-  // Document count, committed, and the database's size in bytes.
+  // Document count, committed, the database's size in bytes, and when the
+  // last commit that changed it ended (Unix seconds, null before the first).
   Json::Value Stats();
 
   // Commits, then folds the write-ahead log into the database file and

@@ -15,6 +15,7 @@
 #include "orvex/foundation/error.h"
 #include "orvex/foundation/json.h"
 #include "orvex/portable/root.h"
+#include "terminal_text.h"
 
 namespace orvex_cli {
 namespace {
@@ -41,8 +42,8 @@ constexpr char kSearchUsage[] =
 
 constexpr char kStatsUsage[] =
     "usage: orvex stats [--json]\n"
-    "Prints each search index: its id, documents, size on disk, whether it is paused\n"
-    "and whether it holds uncommitted changes.\n";
+    "Prints each search index: its id, documents, size on disk, whether it is paused,\n"
+    "whether it holds uncommitted changes, and when it was last committed.\n";
 
 Json::Value AskSearchDaemon(const Json::Value& request) {
   return AskDaemon(kSearchSocketPath, "the search daemon kaloelasticd", request);
@@ -173,7 +174,11 @@ int RunStatsCommand(const Args& args) {
   for (const Json::Value& index : data["indexes"]) {
     std::cout << index["id"].asString() << "\t" << Field(index["documents"]) << " documents\t"
               << Field(index["bytes"]) << " bytes" << (index["paused"].asBool() ? "\tpaused" : "")
-              << (index["uncommitted"].asBool() ? "\tuncommitted changes" : "") << "\n";
+              << (index["uncommitted"].asBool() ? "\tuncommitted changes" : "") << "\t"
+              << (index["last_commit"].isInt64()
+                      ? "last commit " + LocalTime(index["last_commit"].asInt64())
+                      : std::string("never committed"))
+              << "\n";
   }
   return kExitOk;
 }

@@ -68,17 +68,6 @@ constexpr int64_t kLatestResumeTime = INT32_MAX;
 // each, so that a writer holding the status lock for a moment is waited for.
 constexpr unsigned long kShortWaitMicros = 10000;
 
-std::string LocalTime(int64_t seconds) {
-  const time_t t = static_cast<time_t>(seconds);
-  struct tm local;
-  char text[64];
-  if (::localtime_r(&t, &local) == nullptr ||
-      std::strftime(text, sizeof(text), "%Y-%m-%d %H:%M:%S %Z", &local) == 0) {
-    return std::to_string(seconds);
-  }
-  return text;
-}
-
 std::string PauseState(int64_t resume_time) {
   if (resume_time == orvex::fileindex::kResumeTimeRunning) return "running";
   if (resume_time == orvex::fileindex::kResumeTimeNoEnd) return "paused with no end";

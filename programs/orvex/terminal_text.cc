@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 
 #include "orvex/portable/utf8_text.h"
 
@@ -61,6 +62,17 @@ std::string FormatTable(const std::vector<std::vector<std::string>>& rows) {
     out += "\n";
   }
   return out;
+}
+
+std::string LocalTime(int64_t seconds) {
+  const time_t t = static_cast<time_t>(seconds);
+  struct tm local;
+  char text[64];
+  if (::localtime_r(&t, &local) == nullptr ||
+      std::strftime(text, sizeof(text), "%Y-%m-%d %H:%M:%S %Z", &local) == 0) {
+    return std::to_string(seconds);
+  }
+  return text;
 }
 
 std::string Cause(int err) {

@@ -6,6 +6,7 @@
 #define ORVEX_PROGRAMS_ORVEX_TERMINAL_TEXT_H_
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -28,6 +29,10 @@ std::string PadToWidth(const std::string& text, size_t width);
 // The rows as lines, each column padded to its widest cell and separated by
 // two spaces; the last column is not padded.
 std::string FormatTable(const std::vector<std::vector<std::string>>& rows);
+
+// A Unix time as local date and time with its zone, "2026-11-24 21:05:00
+// CET"; the number itself when the time cannot be shown.
+std::string LocalTime(int64_t seconds);
 
 // strerror(err) as it reads inside a sentence: "permission denied".
 std::string Cause(int err);

@@ -229,6 +229,7 @@ TEST_F(KaloelasticdTest, TheToolSearchesAndShowsStats) {
   run = tool({"stats"});
   EXPECT_EQ(0, run.status) << run.err;
   EXPECT_EQ("fileindex_s\t2 documents\t", run.out.substr(0, 24)) << run.out;
+  EXPECT_NE(std::string::npos, run.out.find("\tlast commit 20")) << run.out;
   run = tool({"search", "--sort", "colour"});
   EXPECT_EQ(2, run.status);
   EXPECT_NE(std::string::npos, run.err.find("error 1103")) << run.err;

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <ctime>
 #include <filesystem>
 #include <random>
 #include <set>
@@ -571,6 +572,21 @@ TEST_F(SearchEngineTest, APausedIndexAnswersReadsRefusesWritesAndSurvivesARestar
   Ok(Command("index_resume", kId));
   EXPECT_FALSE(Ok(stats)["data"]["indexes"][0]["paused"].asBool());
   Ok(writes[0]);
+}
+
+TEST_F(SearchEngineTest, StatsTellWhenTheIndexWasLastCommitted) {
+  const Json::Value stats = Request("stats");
+  auto last_commit = [&] { return Ok(stats)["data"]["indexes"][0]["last_commit"]; };
+  Ok(Upsert(kId, FileDoc("/v/s/a")));
+  const int64_t before = std::time(nullptr);
+  Commit();
+  const int64_t after = std::time(nullptr);
+  const Json::Value committed = last_commit();
+  ASSERT_TRUE(committed.isInt64()) << toString(committed);
+  EXPECT_LE(before, committed.asInt64());
+  EXPECT_GE(after, committed.asInt64());
+  Restart();
+  EXPECT_EQ(committed, last_commit());
 }
 
 TEST_F(SearchEngineTest, ConfigSetRenamesAndMovesTheDatabaseWhole) {
