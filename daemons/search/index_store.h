@@ -32,8 +32,8 @@ struct SearchQuery {
   std::optional<int64_t> size_min, size_max;
   std::optional<int64_t> mtime_min, mtime_max;  // KALOMDFSContentChangeDate
   std::string folder;                           // only documents below this full path
-  std::string owner;          // only documents of this user id (permission trimming)
-  std::string sort = "name";  // "name", "path", "size", "mtime" or "relevance"
+  std::string owner;                            // only documents of this owner's user id
+  std::string sort = "name";                    // "name", "path", "size", "mtime" or "relevance"
   bool descending = false;
   int64_t offset = 0;
   int64_t limit = 50;

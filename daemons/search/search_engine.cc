@@ -1,5 +1,6 @@
 #include "search/search_engine.h"
 
+#include <pwd.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -103,6 +104,20 @@ std::string OptionalStringArg(const Json::Value& data, const char* key) {
   return StringArg(data, key);
 }
 
+// "owner": a user id, or the name of a user the system knows, matched
+// against the owner ids the documents carry (KALOMDOwnerUserID).
+std::string OwnerArg(const Json::Value& data) {
+  const Json::Value& owner = data["owner"];
+  if (owner.isIntegral() && owner.isInt64()) return std::to_string(owner.asInt64());
+  const std::string name = OptionalStringArg(data, "owner");
+  const bool is_id =
+      std::all_of(name.begin(), name.end(), [](char c) { return c >= '0' && c <= '9'; });
+  if (is_id) return name;
+  const struct passwd* pw = ::getpwnam(name.c_str());
+  if (pw == nullptr) throw SearchError(kBadArgument, "\"owner\": no user \"" + name + "\"");
+  return std::to_string(pw->pw_uid);
+}
+
 // Bounds on a search's strings. Each word of a text query is one more
 // full-text lookup joined with the others (10,000 words take a second), and
 // no file name is longer than 255 bytes, so no longer fragment can match.
@@ -136,6 +151,7 @@ SearchQuery ParseQuery(const Json::Value& data) {
   q.type = OptionalStringArg(data, "type");
   q.extension = OptionalStringArg(data, "extension");
   q.folder = OptionalStringArg(data, "folder");
+  q.owner = OwnerArg(data);
   q.size_min = OptionalIntArg(data, "size_min");
   q.size_max = OptionalIntArg(data, "size_max");
   q.mtime_min = OptionalIntArg(data, "mtime_min");

@@ -24,8 +24,8 @@ constexpr char kSearchSocketPath[] = "/var/run/kaloelasticd.sock";
 
 constexpr char kSearchUsage[] =
     "usage: orvex search [QUERY] [--name FRAGMENT] [--type TYPE] [--ext EXT]\n"
-    "                    [--in FOLDER] [--share NAME] [--sort KEY] [--desc]\n"
-    "                    [--limit N] [--offset N] [--user NAME] [--json]\n"
+    "                    [--in FOLDER] [--owner USER] [--share NAME] [--sort KEY]\n"
+    "                    [--desc] [--limit N] [--offset N] [--user NAME] [--json]\n"
     "Searches the indexed shares. QUERY is words, \"phrases\", prefix*, OR and\n"
     "-excluded words in the files' text and metadata; each hit shows its matched\n"
     "words. Prints one line per hit: type, size, path (and the matched text).\n"
@@ -33,6 +33,7 @@ constexpr char kSearchUsage[] =
     "  --type TYPE      dir, document, audio, video, image or other\n"
     "  --ext EXT        only this extension\n"
     "  --in FOLDER      only below this full path\n"
+    "  --owner USER     only files this user (a name or a user id) owns\n"
     "  --share NAME     only this share's index\n"
     "  --sort KEY       name (default; relevance with QUERY), path, size or mtime;\n"
     "                   --desc reverses\n"
@@ -63,8 +64,8 @@ Json::Value ParseSearch(const Args& args, bool& json) {
   static const struct {
     const char* option;
     const char* member;
-  } kText[] = {{"--name", "name"}, {"--type", "type"}, {"--ext", "extension"},
-               {"--in", "folder"}, {"--sort", "sort"}, {"--user", "user"}};
+  } kText[] = {{"--name", "name"},   {"--type", "type"}, {"--ext", "extension"}, {"--in", "folder"},
+               {"--owner", "owner"}, {"--sort", "sort"}, {"--user", "user"}};
   for (size_t i = 0; i < args.size(); ++i) {
     const std::string& arg = args[i];
     auto value = [&]() -> std::string {

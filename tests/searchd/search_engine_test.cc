@@ -373,6 +373,15 @@ TEST_F(SearchEngineTest, SearchFiltersSortsAndPages) {
             HitPaths(answer));
   EXPECT_EQ((std::vector<std::string>{"/v/s/d1/f101.pdf", "/v/s/d1/f107.pdf"}),
             Found(R"({"extension": "PDF", "folder": "/v/s/d1", "size_max": 100})"));
+  // The owner by id, as a number or text, or by name (root is id 0).
+  Ok(Upsert(kId, DocWith("/v/s/mine.txt", R"({"KALOMDOwnerUserID": "0"})")));
+  Ok(Upsert(kId, DocWith("/v/s/theirs.txt", R"({"KALOMDOwnerUserID": 1024})")));
+  Commit();
+  const std::vector<std::string> mine = {"/v/s/mine.txt"}, theirs = {"/v/s/theirs.txt"};
+  EXPECT_EQ(mine, Found(R"({"owner": "root"})"));
+  EXPECT_EQ(mine, Found(R"({"owner": 0})"));
+  EXPECT_EQ(theirs, Found(R"({"owner": "1024"})"));
+  EXPECT_EQ(search::kBadArgument, ErrorCode(Request("search", R"({"owner": "no such user"})")));
 }
 
 TEST_F(SearchEngineTest, TextQueriesTakeWordsPhrasesAndPrefixes) {
