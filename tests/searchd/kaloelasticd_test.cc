@@ -127,6 +127,66 @@ TEST_F(KaloelasticdTest, TheNextDaemonHasTheLastCommitAfterAStopOrAKill) {
   }
 }
 
+// When the file was last written, to the nanosecond.
+struct timespec ModTime(const std::string& path) {
+  struct stat st = {};
+  ::stat(path.c_str(), &st);
+  return st.st_mtim;
+}
+
+// A kill -9 while the last commit of a 100,000-document load is being
+// written: the next daemon opens the index and holds exactly one of the two
+// states that commit divides, whole.
+TEST_F(KaloelasticdTest, AKillDuringALoadLeavesExactlyTheLastCommittedState) {
+  Start();
+  CreateIndex();
+  constexpr int kDocuments = 100000, kCompound = 1000, kCommitEvery = 10000;
+  const std::string log = root_.Join("volume1/s/@eaDir/@fileindex/db-wal");
+  // A folder of each thousand: d0 to d99.
+  auto path_of = [](int i) {
+    return "/v/s/d" + std::to_string(i / kCompound) + "/f" + std::to_string(i);
+  };
+  for (int first = 0; first < kDocuments; first += kCompound) {
+    std::string compound = R"({"compound":[)";
+    for (int i = first; i < first + kCompound; ++i) {
+      compound += (i == first ? "" : ",") + toString(Upsert(kId, FileDoc(path_of(i))));
+    }
+    compound += "]}";
+    FileDescriptor fd = ConnectUnix(SocketPath());
+    ASSERT_TRUE(SendBytes(fd.get(), Framed(compound)));
+    ASSERT_TRUE(ReadAnswer(fd.get())["success"].asBool());
+    if ((first + kCompound) % kCommitEvery != 0) continue;
+    if (first + kCompound < kDocuments) {
+      Ok(Command("commit", kId));
+      continue;
+    }
+    // The log's first new page marks the commit under way.
+    const struct timespec before = ModTime(log);
+    FileDescriptor committing = ConnectUnix(SocketPath());
+    ASSERT_TRUE(SendBytes(committing.get(), Framed(toString(Command("commit", kId)))));
+    WaitUntil(
+        [&] {
+          const struct timespec now = ModTime(log);
+          return now.tv_sec != before.tv_sec || now.tv_nsec != before.tv_nsec;
+        },
+        std::chrono::seconds(30), std::chrono::milliseconds(0));
+    daemon_.Stop(SIGKILL);
+  }
+  Start();
+  const int64_t documents = Ok(Request("stats"))["data"]["indexes"][0]["documents"].asInt64();
+  ASSERT_TRUE(documents == kDocuments - kCommitEvery || documents == kDocuments) << documents;
+  // Every folder of the commits kept is whole, and none after them is there.
+  for (const int folder : {0, 89, 90, 99}) {
+    const std::string filter = R"({"folder": "/v/s/d)" + std::to_string(folder) + R"("})";
+    const int expected = folder * kCompound < documents ? kCompound : 0;
+    EXPECT_EQ(expected, Ok(Request("search", filter))["data"]["total"].asInt()) << folder;
+  }
+  // And the index takes writes again.
+  Ok(Upsert(kId, FileDoc("/v/s/after")));
+  Ok(Command("commit", kId));
+  EXPECT_EQ(documents + 1, Ok(Request("stats"))["data"]["indexes"][0]["documents"].asInt64());
+}
+
 TEST_F(KaloelasticdTest, BadFramesGetClearErrorsAndTheDaemonGoesOn) {
   Start();
   CreateIndex();
